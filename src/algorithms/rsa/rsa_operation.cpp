@@ -1,0 +1,67 @@
+#include "algorithms/rsa/rsa_operation.h"
+
+#include <cstring>
+
+#include "algorithms/rsa/rsa_key_data.h"
+#include "platform/trace.h"
+
+namespace keymaster {
+
+TEE_Result resolve_rsa_key(rsa_operation_t& op, std::span<const uint8_t> key_data, keymaster_error_t* error) {
+  TEE_ObjectHandle key = TEE_HANDLE_NULL;
+  const TEE_Result result = rsa_resolve_key_data(key_data, &key, &op.key_size, error);
+  op.key.reset(key);
+  if (result != TEE_SUCCESS || *error != KM_ERROR_OK) {
+    TRACE_ERROR("Resolve key data failed");
+    return result;
+  }
+  if (!op.buffer.allocate(op.modulus_size())) {
+    TRACE_ERROR("Out of memory");
+    *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
+  }
+  return TEE_SUCCESS;
+}
+
+TEE_Result set_rsa_operation(rsa_operation_t& op, uint32_t algorithm, uint32_t mode) {
+  if (TEE_Result r = op.operation.allocate(algorithm, mode, op.key_size); r != TEE_SUCCESS) {
+    TRACE_ERROR("AllocateOperation failed with 0x%08x\n", r);
+    return r;
+  }
+  if (TEE_Result r = TEE_SetOperationKey(op.operation.get(), op.key.get()); r != TEE_SUCCESS) {
+    TRACE_ERROR("SetOperationKey failed with 0x%08x\n", r);
+    return r;
+  }
+  return TEE_SUCCESS;
+}
+
+keymaster_error_t gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit,
+                                 uint32_t* input_consumed, const char* too_long) {
+  const uint64_t total = uint64_t{op.buffered} + input.size();
+  if (static_cast<int64_t>(total) > limit) {
+    TRACE_ERROR(too_long, op.key_size, static_cast<uint32_t>(total));
+    *input_consumed = 0;
+    return KM_ERROR_INVALID_INPUT_LENGTH;
+  }
+  if (!input.empty()) std::memcpy(op.buffer.data() + op.buffered, input.data(), input.size());
+  op.buffered = static_cast<uint32_t>(total);
+  return KM_ERROR_OK;
+}
+
+void trace_incomplete(const rsa_operation_t* op, const char* is_null, const char* is_invalid) {
+  if (op == nullptr) {
+    TRACE_ERROR("%s", is_null);
+    return;
+  }
+  if (!op->key) TRACE_ERROR("%s", is_invalid);
+  if (!op->operation) TRACE_ERROR("%s", is_invalid);
+  if (!op->buffer) TRACE_ERROR("%s", is_invalid);
+}
+
+void right_align(std::span<uint8_t> block, uint32_t length) {
+  if (length >= block.size()) return;
+  const std::size_t front = block.size() - length;
+  std::memmove(block.data() + front, block.data(), length);
+  std::memset(block.data(), 0, front);
+}
+
+}  // namespace keymaster

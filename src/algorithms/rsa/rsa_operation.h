@@ -1,0 +1,68 @@
+// What the records of all RSA operations have in common.
+#ifndef KEYMASTER_ALGORITHMS_RSA_RSA_OPERATION_H_
+#define KEYMASTER_ALGORITHMS_RSA_RSA_OPERATION_H_
+
+#include <cstdint>
+#include <span>
+
+#include "params/operation.h"
+#include "platform/bytes.h"
+#include "platform/handles.h"
+
+namespace keymaster {
+
+/// An RSA operation: the platform's operation with its key, and the input gathered so far. The members free themselves.
+struct rsa_operation_t : keymaster_operation_t {
+  operation_handle operation;
+  operation_handle digest_operation;  // empty: no digest is computed here
+  object_handle key;
+  secret_bytes buffer;  // key size / 8 bytes, zero where nothing was gathered
+  uint32_t buffered = 0;
+  uint32_t digest = 0;
+  uint32_t padding = 0;
+  uint32_t key_size = 0;  // bits
+
+  [[nodiscard]] uint32_t modulus_size() const { return key_size / 8; }
+};
+
+/// resolve_rsa_key makes the key of `op` from key data, and its buffer. A platform failure is the result; want of
+/// memory is KM_ERROR_MEMORY_ALLOCATION_FAILED.
+[[nodiscard]] TEE_Result resolve_rsa_key(rsa_operation_t& op, std::span<const uint8_t> key_data,
+                                         keymaster_error_t* error);
+
+/// set_rsa_operation makes the platform's operation of `op` for `algorithm` and `mode` and gives it the key.
+[[nodiscard]] TEE_Result set_rsa_operation(rsa_operation_t& op, uint32_t algorithm, uint32_t mode);
+
+/// gather_message appends `input` to the buffer of `op` as long as no more than `limit` bytes come together. Otherwise
+/// it traces `too_long` with the key size and the would-be total, consumes nothing and answers
+/// KM_ERROR_INVALID_INPUT_LENGTH.
+[[nodiscard]] keymaster_error_t gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit,
+                                               uint32_t* input_consumed, const char* too_long);
+
+/// finish_record hands out `op` when its set-up succeeded, and deletes it otherwise.
+template <class Record>
+[[nodiscard]] keymaster_operation_t* finish_record(Record* op, TEE_Result result, keymaster_error_t error) {
+  if (result == TEE_SUCCESS && error == KM_ERROR_OK) return op;
+  delete_record(op);
+  return nullptr;
+}
+
+/// trace_incomplete is the part of free_record that does not depend on the type.
+void trace_incomplete(const rsa_operation_t* op, const char* is_null, const char* is_invalid);
+
+/// free_record frees a record of type `Record`. `is_null` is traced when there is none, `is_invalid` for each of its
+/// indispensable members that is missing.
+template <class Record>
+void free_record(keymaster_operation_t* op, const char* is_null, const char* is_invalid) {
+  Record* const record = static_cast<Record*>(op);
+  trace_incomplete(record, is_null, is_invalid);
+  delete_record(record);
+}
+
+/// right_align moves the `length` bytes at the start of `block` to its end and zeros what is in front of them: the
+/// platform drops leading zeros of a number, and a number of fixed width has them.
+void right_align(std::span<uint8_t> block, uint32_t length);
+
+}  // namespace keymaster
+
+#endif  // KEYMASTER_ALGORITHMS_RSA_RSA_OPERATION_H_

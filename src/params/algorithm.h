@@ -1,0 +1,81 @@
+// How the generic layers see an algorithm: one descriptor, and through it one record per purpose. Any entry may be
+// null; whoever calls one looks first.
+#ifndef KEYMASTER_PARAMS_ALGORITHM_H_
+#define KEYMASTER_PARAMS_ALGORITHM_H_
+
+#include <cstdint>
+#include <span>
+
+#include "params/key_param.h"
+#include "params/operation.h"
+#include "platform/bytes.h"
+#include "tee_internal_api.h"
+
+namespace keymaster {
+
+/// Answers of get_padding, get_block_mode and get_digest.
+inline constexpr int parameter_found = 0;
+inline constexpr int parameter_not_applicable = 1;
+
+/// What an algorithm offers for one purpose.
+struct keymaster_purpose_ops {
+  uint32_t (*get_support_block_mode_cnt)();
+  void (*get_support_block_mode)(uint32_t* block_modes);
+  uint32_t (*get_support_padding_mode_cnt)();
+  void (*get_support_padding_mode)(uint32_t* paddings);
+  uint32_t (*get_support_digest_cnt)();
+  void (*get_support_digest)(uint32_t* digests);
+
+  /// create_operation builds the algorithm's record, or answers null and says why: a platform failure in `*result`, a
+  /// Keymaster error in `*error`, either of which may stay zero. A failure leaves nothing behind, and no parameter in
+  /// `request.out_params`.
+  keymaster_operation_t* (*create_operation)(const operation_request& request, TEE_Result* result,
+                                             keymaster_error_t* error);
+
+  /// What `params` ask for: parameter_found and the value, or parameter_not_applicable and the value untouched.
+  int (*get_padding)(const keymaster_key_param_set_t& params, uint32_t* padding);
+  int (*get_block_mode)(const keymaster_key_param_set_t& params, uint32_t* block_mode);
+  int (*get_digest)(const keymaster_key_param_set_t& params, uint32_t* digest);
+};
+
+struct keymaster_algorithm_descriptor {
+  uint32_t algorithm;
+  const char* name;
+  const keymaster_purpose_ops* (*get_purpose_ops)(uint32_t purpose);
+  uint32_t (*get_support_import_format_cnt)();
+  void (*get_support_import_format)(uint32_t* formats);
+  uint32_t (*get_support_export_format_cnt)();
+  void (*get_support_export_format)(uint32_t* formats);
+
+  /// generate_key makes a key as `params` ask and adds to them what becomes known; key data and parameters go into the
+  /// blob. On failure `key_data` is empty.
+  TEE_Result (*generate_key)(keymaster_key_param_set_t* params, secret_bytes& key_data, keymaster_error_t* error);
+
+  /// import_key takes key material in the algorithm's own layout. `material` is TA memory.
+  TEE_Result (*import_key)(keymaster_key_param_set_t* params, std::span<const uint8_t> material, secret_bytes& key_data,
+                           keymaster_error_t* error);
+
+  /// export_key writes the public key to `output`; `*output_length` is the capacity on entry, the size on return.
+  TEE_Result (*export_key)(std::span<const uint8_t> key_data, uint8_t* output, uint32_t* output_length,
+                           keymaster_error_t* error);
+};
+
+/// An algorithm's lists are constant arrays; constant_list makes the pair of entries that a descriptor holds for one.
+/// The array is copied bytewise: the output is client memory of any alignment.
+template <const auto& List>
+struct constant_list {
+  static uint32_t count() { return static_cast<uint32_t>(List.size()); }
+  static void copy(uint32_t* values) {
+    if constexpr (List.size() != 0) std::memcpy(static_cast<void*>(values), List.data(), sizeof List);
+  }
+};
+
+/// default_error turns a failure that says nothing into KM_ERROR_UNKNOWN_ERROR: both codes zero would look like
+/// success.
+inline void default_error(bool failed, TEE_Result result, keymaster_error_t* error) {
+  if (failed && result == TEE_SUCCESS && *error == KM_ERROR_OK) *error = KM_ERROR_UNKNOWN_ERROR;
+}
+
+}  // namespace keymaster
+
+#endif  // KEYMASTER_PARAMS_ALGORITHM_H_
