@@ -56,6 +56,7 @@ class basic_bytes {
   }
 
   void reset() {
+    if (data_ == nullptr) return;
     if constexpr (Secret) wipe(data_, size_);
     TEE_Free(std::exchange(data_, nullptr));
     size_ = 0;

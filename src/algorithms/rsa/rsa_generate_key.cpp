@@ -1,6 +1,6 @@
 #include "algorithms/rsa/rsa_key.h"
 #include "algorithms/rsa/rsa_key_data.h"
-#include "params/algorithm.h"
+#include "params/key_tags.h"
 #include "platform/byte_order.h"
 #include "platform/cursor.h"
 #include "platform/handles.h"
@@ -18,27 +18,14 @@ struct generation_request {
 };
 
 keymaster_error_t read_request(keymaster_key_param_set_t* params, generation_request& request) {
-  if (key_param_set_contains(*params, KM_TAG_ORIGIN)) {
-    TRACE_ERROR("Shouldn't specify KM_TAG_ORIGIN");
-    return KM_ERROR_INVALID_ARGUMENT;
-  }
-  if (const keymaster_error_t e = key_param_set_append(params, integer_param(KM_TAG_ORIGIN, KM_ORIGIN_GENERATED));
-      e != KM_ERROR_OK) {
-    TRACE_ERROR("Out of memory");
-    return e;
-  }
+  if (const keymaster_error_t e = add_origin(params, KM_ORIGIN_GENERATED); e != KM_ERROR_OK) return e;
   const keymaster_key_param_t* const exponent = key_param_set_get_unique(*params, KM_TAG_RSA_PUBLIC_EXPONENT);
   if (exponent == nullptr) {
     TRACE_ERROR("No or too many KM_TAG_RSA_PUBLIC_EXPONENT specified");
     return KM_ERROR_INVALID_ARGUMENT;
   }
-  const keymaster_key_param_t* const key_size = key_param_set_get_unique(*params, KM_TAG_KEY_SIZE);
-  if (key_size == nullptr) {
-    TRACE_ERROR("No or too many KM_TAG_KEY_SIZE or specified");
-    return KM_ERROR_INVALID_ARGUMENT;
-  }
-  request.key_size = key_size->integer;
   request.exponent_big_endian = swap_u64(exponent->long_integer);
+  if (const keymaster_error_t e = read_key_size(*params, &request.key_size); e != KM_ERROR_OK) return e;
   return check_rsa_key_size(request.key_size);
 }
 

@@ -2,41 +2,13 @@
 
 #include "algorithms/rsa/rsa_key.h"
 #include "algorithms/rsa/rsa_key_data.h"
+#include "params/key_tags.h"
 #include "platform/byte_order.h"
 #include "platform/cursor.h"
 #include "platform/trace.h"
 
 namespace keymaster {
 namespace {
-
-keymaster_error_t append(keymaster_key_param_set_t* params, const keymaster_key_param_t& param) {
-  const keymaster_error_t error = key_param_set_append(params, param);
-  if (error != KM_ERROR_OK) TRACE_ERROR("Out of memory");
-  return error;
-}
-
-keymaster_error_t add_origin(keymaster_key_param_set_t* params) {
-  if (key_param_set_contains(*params, KM_TAG_ORIGIN)) {
-    TRACE_ERROR("Shouldn't specify KM_TAG_ORIGIN");
-    return KM_ERROR_INVALID_ARGUMENT;
-  }
-  return append(params, integer_param(KM_TAG_ORIGIN, KM_ORIGIN_IMPORTED));
-}
-
-/// Compares the modulus with the size that the client states, or states it for the client. Every byte of the field
-/// counts: a modulus with a leading zero is taken 8 bits larger.
-keymaster_error_t settle_key_size(keymaster_key_param_set_t* params, uint64_t guessed) {
-  if (const keymaster_key_param_t* given = key_param_set_get_unique(*params, KM_TAG_KEY_SIZE); given != nullptr) {
-    if (given->integer != guessed) {
-      TRACE_ERROR("Key size mismatch (given %d, guessed %d)", given->integer, static_cast<uint32_t>(guessed));
-      return KM_ERROR_IMPORT_PARAMETER_MISMATCH;
-    }
-  } else if (const keymaster_error_t e = append(params, integer_param(KM_TAG_KEY_SIZE, static_cast<uint32_t>(guessed)));
-             e != KM_ERROR_OK) {
-    return e;
-  }
-  return check_rsa_key_size(guessed);
-}
 
 /// Compares the exponent with the one that the client states, in the last bytes of its 8-byte form, or states it for
 /// the client.
@@ -50,7 +22,7 @@ keymaster_error_t settle_exponent(keymaster_key_param_set_t* params, std::span<c
   const keymaster_key_param_t* const given = key_param_set_get_unique(*params, KM_TAG_RSA_PUBLIC_EXPONENT);
   if (given == nullptr) {
     if (!field.empty()) std::memcpy(low_bytes, field.data(), field.size());
-    return append(params, long_param(KM_TAG_RSA_PUBLIC_EXPONENT, swap_u64(load_u64(big_endian))));
+    return add_param(params, long_param(KM_TAG_RSA_PUBLIC_EXPONENT, swap_u64(load_u64(big_endian))));
   }
   const uint64_t swapped = swap_u64(given->long_integer);
   std::memcpy(big_endian, &swapped, sizeof swapped);
@@ -84,9 +56,11 @@ TEE_Result rsa_import_key(keymaster_key_param_set_t* params, std::span<const uin
   rsa_components components;
   if (!read_rsa_components(in, components)) return TEE_ERROR_GENERIC;
 
+  // Every byte of the field counts: a modulus with a leading zero is taken 8 bits larger.
   const uint64_t key_size = uint64_t{components[rsa_modulus].size()} * 8;
-  *error = add_origin(params);
+  *error = add_origin(params, KM_ORIGIN_IMPORTED);
   if (*error == KM_ERROR_OK) *error = settle_key_size(params, key_size);
+  if (*error == KM_ERROR_OK) *error = check_rsa_key_size(key_size);
   if (*error == KM_ERROR_OK) *error = settle_exponent(params, components[rsa_public_exponent]);
   if (*error == KM_ERROR_OK) {
     const std::span<const uint8_t> parsed = material.first(material.size() - in.remaining());
