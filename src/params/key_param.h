@@ -44,8 +44,8 @@ static_assert(offsetof(keymaster_key_param_t, blob) + offsetof(keymaster_blob_t,
 
 /// A counted array of parameters.
 struct keymaster_key_param_set_t {
-  keymaster_key_param_t* params;
-  uint32_t length;
+  keymaster_key_param_t* params = nullptr;
+  uint32_t length = 0;
 };
 
 /// keymaster_tag_get_type answers the type bits of a tag, which need not be one of the known types.
@@ -103,7 +103,7 @@ void keymaster_free_param_set(keymaster_key_param_set_t* set);
 /// parameter_set is the owner of a set.
 class parameter_set : public keymaster_key_param_set_t {
  public:
-  parameter_set() : keymaster_key_param_set_t{nullptr, 0} {}
+  parameter_set() = default;
   parameter_set(parameter_set&& other) noexcept : keymaster_key_param_set_t(other.release()) {}
   parameter_set& operator=(parameter_set&& other) noexcept {
     if (this != &other) {

@@ -125,7 +125,7 @@ uint32_t marshal_size(const keymaster_key_param_set_t& set, bool include_hidden)
   uint64_t size = sizeof(uint32_t);
   for (const keymaster_key_param_t& param : records(set)) {
     if (!is_written(param, include_hidden)) continue;
-    size += record_size + (tag_has_blob(param.tag) ? param.blob.data_length : 0);
+    size += uint64_t{record_size} + (tag_has_blob(param.tag) ? param.blob.data_length : 0);
   }
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }

@@ -1,0 +1,65 @@
+#include "tee/client/connection.h"
+
+#include <pwd.h>
+#include <unistd.h>
+
+#include <array>
+#include <cstdlib>
+#include <string_view>
+#include <utility>
+
+namespace hosted_tee {
+namespace {
+
+constexpr std::string_view embedded = "embedded:";
+
+constexpr std::array<std::pair<world_fault, TEEC_Result>, 4> fault_results{{
+    {world_fault::busy, TEEC_ERROR_BUSY},
+    {world_fault::newer, TEEC_ERROR_BAD_STATE},
+    {world_fault::corrupt, TEEC_ERROR_SECURITY},
+    {world_fault::io, TEEC_ERROR_GENERIC},
+}};
+
+// An empty variable counts as none.
+const char* environment(const char* variable) {
+  const char* value = std::getenv(variable);
+  return value == nullptr || *value == '\0' ? nullptr : value;
+}
+
+std::filesystem::path home_folder() {
+  if (const char* home = environment("HOME")) return home;
+  const passwd* user = ::getpwuid(::geteuid());
+  if (user == nullptr || user->pw_dir == nullptr) throw client_failure(TEEC_ERROR_GENERIC);
+  return user->pw_dir;
+}
+
+std::filesystem::path state_folder_of(const char* name) {
+  if (name == nullptr) name = environment("KEYMASTER_TEE");
+  if (name == nullptr) return default_state_folder();
+  const std::string_view text = name;
+  if (!text.starts_with(embedded) || text.size() == embedded.size()) throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
+  return text.substr(embedded.size());
+}
+
+}  // namespace
+
+std::filesystem::path default_state_folder() {
+  if (const char* folder = environment("KEYMASTER_STATE")) return folder;
+  if (const char* states = environment("XDG_STATE_HOME")) return std::filesystem::path(states) / "keymaster";
+  return home_folder() / ".local" / "state" / "keymaster";
+}
+
+std::shared_ptr<secure_world> connect(const char* name) {
+  world_options options;
+  options.state = state_folder_of(name);
+  return secure_world::open_shared(options);
+}
+
+TEEC_Result result_of(world_fault fault) {
+  for (const auto& [known, result] : fault_results) {
+    if (known == fault) return result;
+  }
+  return TEEC_ERROR_GENERIC;
+}
+
+}  // namespace hosted_tee

@@ -1,0 +1,35 @@
+// The parameters of a TEEC_Operation as the TA gets them, and back.
+#ifndef TEE_CLIENT_PARAMETERS_H_
+#define TEE_CLIENT_PARAMETERS_H_
+
+#include <cstdint>
+
+#include "tee_client_api.h"
+#include "tee_internal_api.h"
+
+namespace hosted_tee {
+
+/// The TA runs in this process and works on the client's own memory: nothing is copied.
+class client_params {
+ public:
+  /// Null stands for an operation without parameters. Throws client_failure: TEEC_ERROR_BAD_PARAMETERS (a type that
+  /// does not exist, a null buffer with a size, shared memory that is not registered, does not allow the direction or
+  /// is too small for the part), TEEC_ERROR_EXCESS_DATA (more than 32 bits of size).
+  explicit client_params(TEEC_Operation* operation);
+
+  [[nodiscard]] std::uint32_t types() const { return types_; }
+  [[nodiscard]] TEE_Param* slots() { return slots_; }
+
+  /// hand_back puts values and sizes where the client looks for them. A size may be larger than the buffer was: that is
+  /// how a TA tells what it needs.
+  void hand_back() const;
+
+ private:
+  TEEC_Operation* operation_;
+  std::uint32_t types_ = 0;
+  TEE_Param slots_[4] = {};
+};
+
+}  // namespace hosted_tee
+
+#endif  // TEE_CLIENT_PARAMETERS_H_

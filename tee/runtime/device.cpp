@@ -1,0 +1,15 @@
+#include "tee/runtime/device.h"
+
+#include "tee/storage/object_store.h"
+
+namespace hosted_tee {
+
+device_services::device_services() = default;
+device_services::~device_services() = default;
+
+object_store* device_services::store(std::uint32_t storage) const {
+  if (storage == TEE_STORAGE_PRIVATE) return private_store.get();
+  return storage == TEE_STORAGE_RPMB ? rpmb_store.get() : nullptr;
+}
+
+}  // namespace hosted_tee

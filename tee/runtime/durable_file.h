@@ -1,0 +1,29 @@
+// Small files that are there whole, old or new, whenever the process or the machine dies.
+#ifndef TEE_RUNTIME_DURABLE_FILE_H_
+#define TEE_RUNTIME_DURABLE_FILE_H_
+
+#include <filesystem>
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace hosted_tee {
+
+/// Called with the name of each step that a crash could tear.
+using step_observer = std::function<void(std::string_view step)>;
+
+/// write_durably replaces `file` (mode 0600) by `content`: a temporary file beside it, flushed to the disk, renamed
+/// over it, and the folder flushed. `step` sees "<name>:begin", ":written", ":flushed", ":renamed" and ":durable".
+/// Throws std::system_error; the file is the old one then.
+void write_durably(const std::filesystem::path& file, std::string_view content, const step_observer& step);
+
+/// read_file answers nothing when the file is missing; throws std::system_error for every other failure.
+[[nodiscard]] std::optional<std::string> read_file(const std::filesystem::path& file);
+
+/// remove_leftovers deletes the temporary files that a crash of write_durably left in `folder`.
+void remove_leftovers(const std::filesystem::path& folder);
+
+}  // namespace hosted_tee
+
+#endif  // TEE_RUNTIME_DURABLE_FILE_H_

@@ -1,0 +1,82 @@
+#include "tee/runtime/instance_heap.h"
+
+#include <openssl/crypto.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <cstring>
+#include <new>
+
+namespace hosted_tee {
+namespace {
+
+constexpr int fill_pattern = 0xA5;  // easy to see in a debugger, and wrong as a length, a pointer or a string
+
+std::uint64_t charge(std::uint32_t size) {
+  return ((std::uint64_t{size} + 7) & ~std::uint64_t{7}) + instance_heap::block_overhead;
+}
+
+}  // namespace
+
+instance_heap::instance_heap(std::uint32_t limit) : limit_(limit) {}
+
+// What is left belonged to a TA that panicked or forgot it; it may be secret.
+instance_heap::~instance_heap() {
+  for (const auto& [block, info] : blocks_) {
+    void* memory = const_cast<void*>(block);
+    OPENSSL_cleanse(memory, info.size);
+    std::free(memory);
+  }
+}
+
+void* instance_heap::take(std::uint32_t size, bool zero, std::uint64_t bytes_after) {
+  if (bytes_after > limit_) return nullptr;
+  void* block = std::malloc(std::max(size, 1U));
+  if (block == nullptr) return nullptr;
+  try {
+    blocks_.emplace(block, block_info{size, zero});
+  } catch (const std::bad_alloc&) {
+    std::free(block);
+    return nullptr;
+  }
+  std::memset(block, zero ? 0 : fill_pattern, size);
+  bytes_ = static_cast<std::uint32_t>(bytes_after);
+  peak_ = std::max(peak_, bytes_);
+  return block;
+}
+
+void* instance_heap::allocate(std::uint32_t size, bool zero) {
+  return take(size, zero, bytes_ + charge(size));
+}
+
+void instance_heap::release(void* block, const block_info& info) {
+  if (on_free_) on_free_({static_cast<const std::uint8_t*>(block), info.size});
+  blocks_.erase(block);
+  std::free(block);
+}
+
+void* instance_heap::reallocate(void* block, std::uint32_t new_size) {
+  const auto found = blocks_.find(block);
+  if (found == blocks_.end()) return nullptr;
+  const block_info old = found->second;
+  void* moved = take(new_size, old.zero, bytes_ - charge(old.size) + charge(new_size));
+  if (moved == nullptr) return nullptr;
+  std::memcpy(moved, block, std::min(old.size, new_size));
+  release(block, old);
+  return moved;
+}
+
+bool instance_heap::free(void* block) {
+  const auto found = blocks_.find(block);
+  if (found == blocks_.end()) return false;
+  const block_info info = found->second;
+  bytes_ -= static_cast<std::uint32_t>(charge(info.size));
+  release(block, info);
+  return true;
+}
+
+bool instance_heap::owns(const void* block) const {
+  return blocks_.contains(block);
+}
+
+}  // namespace hosted_tee

@@ -1,0 +1,149 @@
+#include "tee/runtime/state_folder.h"
+
+#include <fcntl.h>
+#include <openssl/crypto.h>
+#include <openssl/rand.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <charconv>
+#include <system_error>
+
+#include "tee/runtime/hex.h"
+#include "tee/runtime/property.h"
+#include "tee/runtime/secure_world.h"
+#include "tee/runtime/uuid.h"
+
+namespace hosted_tee {
+namespace {
+
+constexpr unsigned layout_version = 1;
+
+[[noreturn]] void corrupt(const std::filesystem::path& file, const std::string& why) {
+  throw world_error(world_fault::corrupt, file.string() + ": " + why);
+}
+
+// Never open to others, not even for a moment: the storage key will lie in it.
+void make_folder(const std::filesystem::path& folder) {
+  if (folder.has_parent_path()) std::filesystem::create_directories(folder.parent_path());
+  if (::mkdir(folder.c_str(), S_IRWXU) != 0 && errno != EEXIST) {
+    throw std::system_error(errno, std::generic_category(), folder.string());
+  }
+}
+
+file_descriptor take_lock(const std::filesystem::path& folder) {
+  const std::filesystem::path file = folder / "lock";
+  file_descriptor lock(::open(file.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  if (!lock.is_open()) throw std::system_error(errno, std::generic_category(), file.string());
+  if (::flock(lock.get(), LOCK_EX | LOCK_NB) != 0) {
+    if (errno == EWOULDBLOCK) throw world_error(world_fault::busy, folder.string() + " is in use by another process");
+    throw std::system_error(errno, std::generic_category(), file.string());
+  }
+  return lock;
+}
+
+std::string_view trimmed(std::string_view text) {
+  constexpr std::string_view blanks = " \t\r\n";
+  const std::size_t first = text.find_first_not_of(blanks);
+  if (first == std::string_view::npos) return {};
+  return text.substr(first, text.find_last_not_of(blanks) - first + 1);
+}
+
+// The version is written before anything that depends on it.
+void check_version(const std::filesystem::path& folder, const step_observer& step) {
+  const std::filesystem::path file = folder / "version";
+  const std::optional<std::string> content = read_file(file);
+  if (!content) {
+    if (std::filesystem::exists(folder / "device")) corrupt(file, "it is missing beside a device");
+    write_durably(file, std::to_string(layout_version) + "\n", step);
+    return;
+  }
+  const std::string_view text = trimmed(*content);
+  unsigned version = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), version);
+  if (error != std::errc() || end != text.data() + text.size() || version == 0) corrupt(file, "not a version number");
+  if (version > layout_version) {
+    throw world_error(world_fault::newer, folder.string() + " was written by a newer version");
+  }
+}
+
+// Calls `take(name, value)` for each `name = value` line; `take` answers whether it knows the two.
+template <class Take>
+void read_lines(const std::filesystem::path& file, std::string_view content, Take&& take) {
+  while (!content.empty()) {
+    const std::size_t end = content.find('\n');
+    const std::string_view line = trimmed(content.substr(0, end));
+    content.remove_prefix(end == std::string_view::npos ? content.size() : end + 1);
+    if (line.empty() || line.front() == '#') continue;
+    const std::size_t equals = line.find('=');
+    const bool known =
+        equals != std::string_view::npos && take(trimmed(line.substr(0, equals)), trimmed(line.substr(equals + 1)));
+    if (!known) corrupt(file, "can't make sense of the line: " + std::string(line));
+  }
+}
+
+void wipe(std::string& text) {
+  OPENSSL_cleanse(&text[0], text.size());
+}
+
+device_record make_device(const std::filesystem::path& file, const step_observer& step) {
+  device_record device{random_uuid(), {}};
+  if (RAND_bytes(device.key.data(), static_cast<int>(device.key.size())) != 1) {
+    throw world_error(world_fault::io, "libcrypto has no random bytes");
+  }
+  std::string text = "device-id = " + to_text(device.id) + "\nstorage-key = " + to_hex(device.key) + "\n";
+  write_durably(file, text, step);
+  wipe(text);
+  return device;
+}
+
+device_record load_device(const std::filesystem::path& folder, const step_observer& step) {
+  const std::filesystem::path file = folder / "device";
+  std::optional<std::string> content = read_file(file);
+  if (!content) return make_device(file, step);
+  std::optional<TEE_UUID> id;
+  std::optional<storage_key> key;
+  read_lines(file, *content, [&](std::string_view name, std::string_view value) {
+    if (name == "device-id") return (id = parse_uuid(value)).has_value();
+    return name == "storage-key" && from_hex(value, key.emplace());
+  });
+  wipe(*content);
+  if (!id || !key) corrupt(file, "the identity or the storage key is missing");
+  return {*id, *key};
+}
+
+bool take_setting(device_settings& settings, std::string_view name, std::string_view value) {
+  if (name == "rpmb") {
+    settings.rpmb = value == "on";
+    return value == "on" || value == "off";
+  }
+  if (name == "device-id") return (settings.device_id = parse_uuid(value)).has_value();
+  settings.text_properties.emplace(name, value);
+  return is_settable_property(name);
+}
+
+device_settings load_settings(const std::filesystem::path& folder) {
+  const std::filesystem::path file = folder / "settings";
+  device_settings settings;
+  read_lines(file, read_file(file).value_or(""),
+             [&](std::string_view name, std::string_view value) { return take_setting(settings, name, value); });
+  return settings;
+}
+
+}  // namespace
+
+state_folder::state_folder(const std::filesystem::path& path, const step_observer& step) : path_(path) {
+  try {
+    make_folder(path_);
+    lock_ = take_lock(path_);
+    remove_leftovers(path_);
+    check_version(path_, step);
+    device_ = load_device(path_, step);
+    settings_ = load_settings(path_);
+  } catch (const std::system_error& error) {
+    throw world_error(world_fault::io, error.what());
+  }
+}
+
+}  // namespace hosted_tee

@@ -1,0 +1,126 @@
+#include "tee/runtime/world.h"
+
+#include <openssl/rand.h>
+
+#include <algorithm>
+#include <stdexcept>
+
+#include "tee/runtime/instance_scope.h"
+#include "tee/storage/object_store.h"
+
+namespace hosted_tee {
+namespace {
+
+std::vector<std::filesystem::path> folders_of(const world_options& options) {
+  if (options.ta_folder.empty()) return default_ta_folders();
+  return {options.ta_folder};
+}
+
+std::array<std::uint8_t, 32> draw_boot_seed() {
+  std::array<std::uint8_t, 32> seed{};
+  if (RAND_bytes(seed.data(), static_cast<int>(seed.size())) != 1) {
+    throw world_error(world_fault::io, "libcrypto has no random bytes");
+  }
+  return seed;
+}
+
+std::unique_ptr<object_store> open_store(const state_folder& folder, const char* name, bool detects_rollback,
+                                         fault_plan& faults) {
+  const auto step = [&faults](std::string_view reached) { faults.on_storage_step(reached); };
+  try {
+    return std::make_unique<object_store>(folder.path(), folder.device().key,
+                                          store_options{name, detects_rollback, step});
+  } catch (const database_failure& failure) {
+    const std::string file = (folder.path() / name).string() + ".db: ";
+    throw world_error(failure.damaged() ? world_fault::corrupt : world_fault::io, file + failure.what());
+  } catch (const call_failure&) {
+    throw world_error(world_fault::io, (folder.path() / name).string() + ": can't be written");
+  } catch (const std::system_error& error) {
+    throw world_error(world_fault::io, error.what());
+  }
+}
+
+object_key key_of(const TEE_UUID& ta, std::string_view id) {
+  return {to_bytes(ta), std::string(id)};
+}
+
+}  // namespace
+
+world::world(const world_options& options)
+    : folder_(options.state, options.at_storage_step),
+      ta_folders_(folders_of(options)),
+      heap_limit_(options.heap_limit) {
+  const device_settings& settings = folder_.settings();
+  device_.faults.at_storage_step(options.at_storage_step);
+  device_.id = options.device_id.value_or(settings.device_id.value_or(folder_.device().id));
+  device_.boot_seed = options.boot_seed ? *options.boot_seed : draw_boot_seed();
+  device_.text_properties = settings.text_properties;
+  device_.other_tas = this;
+  device_.private_store = open_store(folder_, "private", false, device_.faults);
+  if (options.rpmb.value_or(settings.rpmb.value_or(true))) {
+    device_.rpmb_store = open_store(folder_, "rpmb", true, device_.faults);
+  }
+}
+
+world::~world() = default;
+
+bool world::has_rpmb() const {
+  const std::scoped_lock lock(mutex_);
+  return device_.rpmb_store != nullptr && device_.rpmb_store->check() == TEE_SUCCESS;
+}
+
+accounting world::account(const TEE_UUID& ta) const {
+  const std::scoped_lock lock(mutex_);
+  accounting sum;
+  for (const auto& live : instances_) {
+    if (!same_uuid(live->uuid, ta)) continue;
+    sum.heap_bytes += live->heap.bytes();
+    sum.heap_blocks += live->heap.blocks();
+    sum.heap_peak += live->heap.peak();
+    for (const auto& [handle, item] : live->objects) {
+      ++(item->is_persistent() ? sum.persistent_objects : sum.transient_objects);
+    }
+    sum.operations += static_cast<std::uint32_t>(live->operations.size());
+  }
+  return sum;
+}
+
+bool world::has_instance(const TEE_UUID& ta) const {
+  const std::scoped_lock lock(mutex_);
+  return std::any_of(instances_.begin(), instances_.end(), [&](const auto& i) { return same_uuid(i->uuid, ta); });
+}
+
+void world::set_free_inspector(std::function<void(std::span<const std::uint8_t>)> inspector) {
+  const std::scoped_lock lock(mutex_);
+  free_inspector_ = std::move(inspector);
+  for (const auto& live : instances_) live->heap.set_inspector(free_inspector_);
+}
+
+object_store& world::storage(std::uint32_t storage) const {
+  object_store* store = device_.store(storage);
+  if (store == nullptr) throw std::invalid_argument("the device has no such storage");
+  return *store;
+}
+
+std::optional<std::string> world::read_object(const TEE_UUID& ta, std::uint32_t storage_id, std::string_view id) {
+  const std::scoped_lock lock(mutex_);
+  const auto data = storage(storage_id).read(key_of(ta, id));
+  if (!data) return std::nullopt;
+  return std::string(data->begin(), data->end());
+}
+
+void world::write_object(const TEE_UUID& ta, std::uint32_t storage_id, std::string_view id, std::string_view data) {
+  const std::scoped_lock lock(mutex_);
+  storage(storage_id).write(key_of(ta, id), {reinterpret_cast<const std::uint8_t*>(data.data()), data.size()});
+}
+
+void world::delete_object(const TEE_UUID& ta, std::uint32_t storage_id, std::string_view id) {
+  const std::scoped_lock lock(mutex_);
+  storage(storage_id).remove(key_of(ta, id));
+}
+
+void world::trace_problem(const std::string& text) {
+  device_.trace.add({"TEE", trace_level::error, "secure_world", 0, text});
+}
+
+}  // namespace hosted_tee
