@@ -1,0 +1,124 @@
+#include "client/kmctl/application.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <array>
+#include <cstdlib>
+#include <iostream>
+#include <string_view>
+
+#include "client/kmctl/commands.h"
+#include "client/kmctl/exit_codes.h"
+
+namespace kmctl {
+namespace {
+
+struct command_row {
+  const char* name;
+  const char* description;
+  void (*define)(CLI::App& command, context& ctx);
+};
+
+constexpr std::array command_rows = std::to_array<command_row>({
+    {"info", "Show the TEE, the TA and what it offers", define_info},
+    {"generate", "Make a key and seal it into a blob", define_generate},
+    {"import", "Seal an existing private key into a blob", define_import},
+    {"export", "Write a key's public part", define_export},
+    {"characteristics", "Show what a key may be used for", define_characteristics},
+    {"sign", "Sign a file", define_sign},
+    {"verify", "Check a file's signature", define_verify},
+    {"delete", "Delete a key", define_delete},
+    {"delete-all", "Ask the TA to delete every key", define_delete_all},
+    {"demo", "Show on a file of yours what the system does", define_demo},
+});
+
+constexpr const char* description =
+    "kmctl makes and uses keys that exist outside the TEE only as sealed blobs.\n\n"
+    "A first round:\n"
+    "  kmctl generate key.blob\n"
+    "  kmctl export key.blob -o public.pem\n"
+    "  kmctl sign key.blob letter.txt -o letter.sig\n"
+    "  kmctl verify key.blob letter.sig letter.txt\n"
+    "  openssl dgst -sha256 -verify public.pem -signature letter.sig letter.txt\n"
+    "Every sub-command has a --help with examples of its own.\n";
+
+constexpr const char* environment_help =
+    "Environment:\n"
+    "  KEYMASTER_TEE      the TEE to use, as --tee\n"
+    "  KEYMASTER_STATE    the state folder, as --state (default: keymaster below XDG_STATE_HOME or ~/.local/state)\n"
+    "  KEYMASTER_TRACE    error, info or debug: the secure world's trace on standard error, as --trace\n"
+    "  KEYMASTER_TA_PATH  the folder of the TA images\n";
+
+void add_global_options(CLI::App& app, context& ctx) {
+  auto* const tee = app.add_option("--tee", ctx.tee, "the TEE to use, e.g. embedded:FOLDER")->type_name("NAME");
+  app.add_option("--state", ctx.state, "folder of the device's state; a blob opens only with the state that sealed it")
+      ->type_name("FOLDER")
+      ->excludes(tee);
+  app.add_flag("--json", ctx.json_output, "print results and errors as JSON");
+  app.add_option_function<std::string>(
+         "--trace", [](const std::string& level) { ::setenv("KEYMASTER_TRACE", level.c_str(), 1); },
+         "print the secure world's trace on standard error: error, info or debug")
+      ->check(CLI::IsMember({"error", "info", "debug"}))
+      ->type_name("LEVEL");
+  app.set_version_flag("--version", "kmctl " KEYMASTER_VERSION, "print the version");
+}
+
+/// What parsing could not read yet, an error of the command line itself must still obey.
+bool asks_for_json(int argc, const char* const* argv) {
+  return std::any_of(argv, argv + argc, [](const char* word) { return std::string_view(word) == "--json"; });
+}
+
+int parse_and_run(int argc, const char* const* argv, context& ctx) {
+  const auto app = make_application(ctx);
+  if (argc < 2) {
+    fmt::print(stderr, "{}", app->help());
+    return exit_usage;
+  }
+  try {
+    app->parse(argc, argv);
+    return ctx.exit;
+  } catch (const CLI::ParseError& stop) {
+    if (stop.get_exit_code() == 0) {
+      return app->exit(stop);  // --help or --version
+    }
+    if (const auto rest = app->remaining(); app->get_subcommands().empty() && !rest.empty()) {
+      throw usage_error(fmt::format("there is no sub-command '{}'", rest.front()), "see kmctl --help");
+    }
+    const auto chosen = app->get_subcommands();
+    const std::string command = chosen.empty() ? "kmctl" : "kmctl " + chosen.front()->get_name();
+    throw usage_error(stop.what(), "see " + command + " --help");
+  }
+}
+
+}  // namespace
+
+std::unique_ptr<CLI::App> make_application(context& ctx) {
+  auto app = std::make_unique<CLI::App>(description, "kmctl");
+  app->footer(std::string(environment_help) + "\n" + exit_code_help);
+  app->require_subcommand(1);
+  app->option_defaults()->always_capture_default(false);
+  add_global_options(*app, ctx);
+  for (const command_row& row : command_rows) {
+    CLI::App* const command = app->add_subcommand(row.name, row.description);
+    command->fallthrough();  // so that --json and its like may also stand behind the sub-command
+    row.define(*command, ctx);
+  }
+  return app;
+}
+
+int run(int argc, const char* const* argv) noexcept {
+  context ctx;
+  try {
+    ctx.json_output = asks_for_json(argc, argv);
+    return parse_and_run(argc, argv, ctx);
+  } catch (const std::exception& failed) {
+    try {
+      return tell_failure(ctx, failed);
+    } catch (const std::exception&) {
+      return exit_failure;  // not even the message could be written
+    }
+  }
+}
+
+}  // namespace kmctl

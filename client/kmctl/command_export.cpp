@@ -1,0 +1,169 @@
+// kmctl export, characteristics, delete and delete-all: what can be told of a sealed key, and its end.
+#include <fmt/format.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <system_error>
+
+#include "client/kmctl/authorization_options.h"
+#include "client/kmctl/commands.h"
+#include "client/kmctl/describe.h"
+#include "client/kmctl/exit_codes.h"
+#include "client/kmctl/files.h"
+#include "client/kmctl/values.h"
+#include "client/lib/key_material.h"
+
+namespace kmctl {
+namespace {
+
+namespace client = keymaster::client;
+using client::authorizations;
+
+constexpr const char* export_examples =
+    "Examples:\n"
+    "  kmctl export key.blob                     the public key as PEM\n"
+    "  kmctl export key.blob --der -o public.der\n"
+    "  kmctl export key.blob | openssl pkey -pubin -text -noout\n";
+
+constexpr const char* characteristics_examples =
+    "Examples:\n"
+    "  kmctl characteristics key.blob\n"
+    "  kmctl characteristics --json key.blob | jq .characteristics.padding\n"
+    "  kmctl characteristics --app-id my.app key.blob\n";
+
+constexpr const char* delete_examples =
+    "The TA keeps nothing per key: it is asked, and then the file is removed. A copy of the blob elsewhere still "
+    "works.\n\n"
+    "Examples:\n"
+    "  kmctl delete key.blob\n";
+
+constexpr const char* delete_all_examples =
+    "The TA keeps nothing per key: it is asked, and no file is touched. Blobs still work afterwards; a key ends with "
+    "the\n"
+    "last copy of its blob.\n\n"
+    "Examples:\n"
+    "  kmctl delete-all\n";
+
+struct sealed_key {
+  std::string path;
+  application_options app;
+
+  void add_to(CLI::App& command) {
+    command.add_option("BLOB", path, "sealed key, - for standard input")->required()->type_name("");
+    app.add_to(command);
+  }
+  [[nodiscard]] bytes read() const { return read_small_file(path, "key blob"); }
+};
+
+struct export_options {
+  sealed_key key;
+  std::string out = "-";
+  bool der = false;
+
+  void add_to(CLI::App& command) {
+    key.add_to(command);
+    command.add_option("-o,--output", out, "file for the public key (default: standard output)")->type_name("FILE");
+    command.add_flag("--der", der, "DER in place of PEM");
+    command.footer(export_examples);
+  }
+};
+
+int run_export(const export_options& options, const context& ctx) {
+  if (same_file(options.out, options.key.path)) {
+    throw usage_error("the public key would overwrite the key blob");
+  }
+  const bytes blob = options.key.read();
+  tee_link tee(ctx);
+  const authorizations characteristics = client::get_characteristics(tee.ta(), blob, options.key.app.given());
+  const auto algorithm = static_cast<keymaster::keymaster_algorithm_t>(
+      characteristics.unique_number(keymaster::KM_TAG_ALGORITHM).value_or(0));
+  const bytes exported = client::export_key(tee.ta(), blob, options.key.app.given());
+  if (options.der) {
+    write_binary(options.out, client::public_key_der(algorithm, exported), {});
+  } else if (const std::string pem = client::public_key_pem(algorithm, exported); options.out == "-") {
+    fmt::print("{}", pem);
+  } else {
+    write_file(options.out, client::as_bytes(pem), {});
+  }
+  if (options.out != "-" || ctx.json_output) {
+    tell(ctx, fmt::format("Public part of the {} key in {}", key_title(characteristics), options.out),
+         {{"output", options.out}, {"format", options.der ? "der" : "pem"}, {"key", key_title(characteristics)}},
+         options.out);
+  }
+  return exit_done;
+}
+
+struct characteristics_options {
+  sealed_key key;
+
+  void add_to(CLI::App& command) {
+    key.add_to(command);
+    command.footer(characteristics_examples);
+  }
+};
+
+int run_characteristics(const characteristics_options& options, const context& ctx) {
+  const bytes blob = options.key.read();
+  tee_link tee(ctx);
+  const authorizations list = client::get_characteristics(tee.ta(), blob, options.key.app.given());
+  tell(ctx,
+       fmt::format("{}: {} key, blob of {}\n{}", options.key.path, key_title(list), format_size(blob.size()),
+                   describe_text(list)),
+       {{"blob", options.key.path}, {"size", blob.size()}, {"characteristics", describe_json(list)}});
+  return exit_done;
+}
+
+struct delete_options {
+  std::string path;
+
+  void add_to(CLI::App& command) {
+    command.add_option("BLOB", path, "sealed key")->required()->type_name("");
+    command.footer(delete_examples);
+  }
+};
+
+int run_delete(const delete_options& options, const context& ctx) {
+  if (options.path == "-") {
+    throw usage_error("only a file can be deleted");
+  }
+  const bytes blob = read_small_file(options.path, "key blob");
+  tee_link tee(ctx);
+  client::delete_key(tee.ta(), blob);
+  if (::unlink(options.path.c_str()) != 0) {
+    throw failure_error(fmt::format("can't remove {}: {}", options.path, std::generic_category().message(errno)));
+  }
+  tell(ctx, fmt::format("The TA agreed, and {} is removed. Copies of it would still work.", options.path),
+       {{"deleted", options.path}});
+  return exit_done;
+}
+
+struct delete_all_options {
+  void add_to(CLI::App& command) { command.footer(delete_all_examples); }
+};
+
+int run_delete_all(const delete_all_options& /*options*/, const context& ctx) {
+  tee_link tee(ctx);
+  client::delete_all_keys(tee.ta());
+  tell(ctx, "The TA agreed. It keeps nothing per key; blobs in files are untouched.", {{"deleted", "all"}});
+  return exit_done;
+}
+
+}  // namespace
+
+void define_export(CLI::App& command, context& ctx) {
+  define<export_options>(command, ctx, run_export);
+}
+
+void define_characteristics(CLI::App& command, context& ctx) {
+  define<characteristics_options>(command, ctx, run_characteristics);
+}
+
+void define_delete(CLI::App& command, context& ctx) {
+  define<delete_options>(command, ctx, run_delete);
+}
+
+void define_delete_all(CLI::App& command, context& ctx) {
+  define<delete_all_options>(command, ctx, run_delete_all);
+}
+
+}  // namespace kmctl

@@ -1,0 +1,5 @@
+#include "client/kmctl/application.h"
+
+int main(int argc, char** argv) {
+  return kmctl::run(argc, argv);
+}

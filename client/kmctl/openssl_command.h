@@ -1,0 +1,28 @@
+// The openssl command, as a second opinion that shares nothing with the TA.
+#ifndef KEYMASTER_CLIENT_KMCTL_OPENSSL_COMMAND_H_
+#define KEYMASTER_CLIENT_KMCTL_OPENSSL_COMMAND_H_
+
+#include <string>
+#include <vector>
+
+namespace kmctl {
+
+struct command_result {
+  int status;          ///< the exit code; 128 + n when signal n ended it
+  std::string output;  ///< what it printed, standard output and error together
+};
+
+/// run_command starts a program of the PATH, waits for its end and gives what it printed. Throws failure_error when it
+/// can't be started.
+[[nodiscard]] command_result run_command(const std::vector<std::string>& words);
+
+/// command_line gives the words as a person would type them in a shell.
+[[nodiscard]] std::string command_line(const std::vector<std::string>& words);
+
+/// verify_command gives the words that check an RSA PKCS#1 v1.5 signature over SHA-256 with openssl.
+[[nodiscard]] std::vector<std::string> verify_command(const std::string& public_key, const std::string& signature,
+                                                      const std::string& file);
+
+}  // namespace kmctl
+
+#endif  // KEYMASTER_CLIENT_KMCTL_OPENSSL_COMMAND_H_

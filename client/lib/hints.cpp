@@ -1,0 +1,126 @@
+// The advice that goes with a failure. The first row that fits wins; an empty step fits every command.
+#include <algorithm>
+#include <array>
+#include <string_view>
+
+#include "client/lib/error.h"
+#include "src/params/keymaster_defs.h"
+#include "tee_client_api.h"
+
+namespace keymaster::client {
+namespace {
+
+constexpr std::uint32_t tee_error_mac_invalid = 0xFFFF3071;
+constexpr std::uint32_t ksk_error_deleted = 0xF0100001;
+constexpr std::uint32_t ksk_error_rpmb_gone = 0xF0100003;
+
+struct tee_advice {
+  std::string_view step;
+  std::uint32_t result;
+  std::string_view text;
+};
+
+constexpr std::array tee_advices = std::to_array<tee_advice>({
+    {"connect", TEEC_ERROR_BUSY, "another process uses this TEE: wait for it to end, or choose another state folder"},
+    {"connect", TEEC_ERROR_BAD_STATE,
+     "a newer version wrote the state: use that version, or choose another state folder"},
+    {"connect", TEEC_ERROR_SECURITY,
+     "the state does not authenticate: it was altered or copied together from two devices; restore it or choose "
+     "another"},
+    {"connect", TEEC_ERROR_ITEM_NOT_FOUND, "nothing is behind this TEE name: check the name, or start the server"},
+    {"connect", TEEC_ERROR_COMMUNICATION, "nothing answers behind this TEE name: check the name, or start the server"},
+    {"connect", TEEC_ERROR_BAD_PARAMETERS, "a TEE name has the form embedded:FOLDER"},
+    {"connect", TEEC_ERROR_GENERIC, "check that the state folder can be made and written, and that its disk has room"},
+    {"open_session", TEEC_ERROR_ITEM_NOT_FOUND,
+     "the TEE has no image of the Keymaster TA: build it, or point KEYMASTER_TA_PATH at the folder of the .ta files"},
+    {"open_session", ksk_error_deleted,
+     "the stored key storage key was malformed and is deleted now; the next start makes a new one, and blobs sealed "
+     "under the old one are lost"},
+    {"", tee_error_mac_invalid,
+     "the blob does not authenticate: it was altered, or another device sealed it (another state folder)"},
+    {"", ksk_error_rpmb_gone, "the blob was sealed with the RPMB key, and this device has no RPMB storage now"},
+    {"", TEEC_ERROR_TARGET_DEAD, "the TA stopped: open a new session; blobs stay valid, running operations are lost"},
+    {"", TEEC_ERROR_OUT_OF_MEMORY,
+     "the TA's heap is 512 KiB: use less input at once, or finish other operations first"},
+    {"", TEEC_ERROR_BUSY, "the TEE is busy: try again"},
+    {"generate_key", TEEC_ERROR_BAD_PARAMETERS,
+     "the platform refuses these parameters: a public exponent is odd and at least 3"},
+    {"generate_key", TEEC_ERROR_NOT_SUPPORTED,
+     "the platform does not make keys of this size: RSA takes 512 to 8192 bits"},
+    {"begin", TEEC_ERROR_NOT_SUPPORTED, "the platform does not serve keys of this size: RSA takes 512 to 8192 bits"},
+    {"begin", TEEC_ERROR_BAD_PARAMETERS, "the platform refuses the key's components: the imported key was not sound"},
+    {"finish", TEEC_ERROR_BAD_PARAMETERS,
+     "the platform refuses the input: without a digest it must be a number below the key's modulus"},
+});
+
+struct keymaster_advice {
+  std::string_view step;
+  std::int32_t error;
+  std::string_view text;
+};
+
+constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
+    {"", KM_ERROR_UNSUPPORTED_PURPOSE, "the algorithm does not serve this purpose: kmctl info lists what it does"},
+    {"", KM_ERROR_INCOMPATIBLE_PURPOSE, "the key was not made for this purpose: look at its characteristics"},
+    {"", KM_ERROR_UNSUPPORTED_ALGORITHM, "the TA does not offer this algorithm: kmctl info lists what it offers"},
+    {"", KM_ERROR_UNSUPPORTED_KEY_SIZE, "choose a size of this algorithm: RSA takes multiples of 8 up to 8192 bits"},
+    {"", KM_ERROR_UNSUPPORTED_BLOCK_MODE,
+     "the algorithm does not offer this block mode: kmctl info lists those it does"},
+    {"", KM_ERROR_INCOMPATIBLE_BLOCK_MODE, "the key does not allow this block mode: look at its characteristics"},
+    {"", KM_ERROR_UNSUPPORTED_PADDING_MODE, "this purpose does not offer this padding: kmctl info lists those it does"},
+    {"", KM_ERROR_INCOMPATIBLE_PADDING_MODE, "the key does not allow this padding: look at its characteristics"},
+    {"", KM_ERROR_UNSUPPORTED_DIGEST, "the algorithm does not offer this digest: kmctl info lists those it does"},
+    {"", KM_ERROR_INCOMPATIBLE_DIGEST,
+     "the key does not allow this digest, or it does not go with the padding: PSS needs SHA-1 or SHA-2 and room in the "
+     "key, raw padding needs no digest"},
+    {"", -17, "keys of this algorithm never leave the TA: only RSA and EC keys have a public part"},
+    {"", KM_ERROR_INVALID_INPUT_LENGTH,
+     "without a digest the input is at most as long as the key (11 bytes less with pkcs1-1-5-sign): use a digest"},
+    {"", KM_ERROR_KEY_NOT_YET_VALID, "the key's active date lies ahead: check the clock"},
+    {"", KM_ERROR_KEY_EXPIRED, "the key's date for this purpose has passed: make a new key"},
+    {"", KM_ERROR_KEY_USER_NOT_AUTHENTICATED, "the key's user must authenticate: pass a fresh auth token"},
+    {"", KM_ERROR_INVALID_OPERATION_HANDLE, "the operation has ended (any failure ends it): begin again"},
+    {"", KM_ERROR_VERIFICATION_FAILED,
+     "the signature is not one of this key over this input: check that data, signature, key, padding and digest belong "
+     "together"},
+    {"", KM_ERROR_TOO_MANY_OPERATIONS,
+     "sixteen operations are open, or eight counted keys: finish or abort some first"},
+    {"", KM_ERROR_INVALID_KEY_BLOB,
+     "the file is not a whole key blob, or the application id or data differ from those the key was made with"},
+    {"import_key", KM_ERROR_INVALID_ARGUMENT, "name the algorithm once, and do not state an origin"},
+    {"generate_key", KM_ERROR_INVALID_ARGUMENT,
+     "name algorithm, size and (for RSA) the public exponent exactly once, and do not state an origin"},
+    {"begin", KM_ERROR_INVALID_ARGUMENT,
+     "name padding and digest exactly once; a key with a user id needs an auth type; an auth token must be of this "
+     "boot"},
+    {"", KM_ERROR_INVALID_ARGUMENT, "the parameters do not fit the command: state each one once"},
+    {"", KM_ERROR_INVALID_TAG, "leave out what this command does not take, and state the rest once"},
+    {"", KM_ERROR_MEMORY_ALLOCATION_FAILED, "the TA's heap is 512 KiB: finish other operations first"},
+    {"", KM_ERROR_IMPORT_PARAMETER_MISMATCH, "the stated size or public exponent is not that of the key: leave it out"},
+    {"", KM_ERROR_KEY_RATE_LIMIT_EXCEEDED, "the key may not be used again so soon: wait"},
+    {"", KM_ERROR_CALLER_NONCE_PROHIBITED, "the key does not allow a nonce of the caller's: let the TA draw it"},
+    {"", KM_ERROR_KEY_MAX_OPS_EXCEEDED,
+     "the uses of this boot are used up: they begin anew when the secure world starts again"},
+    {"", KM_ERROR_INVALID_MAC_LENGTH, "ask for a MAC at least as long as the key's minimum"},
+    {"", -58, "state a minimum MAC length"},
+    {"", KM_ERROR_UNSUPPORTED_MIN_MAC_LENGTH,
+     "the minimum MAC length must be a multiple of 8 in the algorithm's range"},
+    {"", KM_ERROR_UNIMPLEMENTED, "the algorithm does not have this step: leave it out"},
+});
+
+}  // namespace
+
+std::string hint_for(const failure& facts) {
+  const auto fits = [&](std::string_view step) { return step.empty() || step == facts.step; };
+  if (facts.tee_result != 0) {
+    const auto row = std::ranges::find_if(
+        tee_advices, [&](const tee_advice& advice) { return advice.result == facts.tee_result && fits(advice.step); });
+    return row == tee_advices.end() ? std::string{} : std::string(row->text);
+  }
+  const auto row = std::ranges::find_if(keymaster_advices, [&](const keymaster_advice& advice) {
+    return advice.error == facts.keymaster_error && fits(advice.step);
+  });
+  return row == keymaster_advices.end() ? std::string{} : std::string(row->text);
+}
+
+}  // namespace keymaster::client
