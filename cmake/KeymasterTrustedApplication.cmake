@@ -20,7 +20,7 @@ function(add_trusted_application name uuid library)
   target_link_libraries(${name} PRIVATE keymaster_ta_options $<LINK_LIBRARY:WHOLE_ARCHIVE,${library}>)
   set_target_properties(${name} PROPERTIES
     PREFIX "" OUTPUT_NAME "${uuid}" SUFFIX ".ta" LIBRARY_OUTPUT_DIRECTORY "${KEYMASTER_TA_FOLDER}")
-  target_link_options(${name} PRIVATE -Wl,--gc-sections -Wl,-z,now -Wl,-z,relro -Wl,--build-id=none)
+  target_link_options(${name} PRIVATE -Wl,--gc-sections -Wl,-Bsymbolic -Wl,-z,now -Wl,-z,relro -Wl,--build-id=none)
   if(NOT KEYMASTER_SANITIZE)
     target_link_options(${name} PRIVATE -nostdlib)
     target_link_libraries(${name} PRIVATE gcc)

@@ -1,4 +1,4 @@
-# shellcheck shell=bash
+# shellcheck shell=bash disable=SC2034
 # What building and testing needs beside a minimal Debian 12. Sourced by ./run and ./test, which set -euo pipefail.
 #
 #   install_packages "${build_packages[@]}"     installs those that are missing; asks the network only then
@@ -32,12 +32,13 @@ missing_packages() {
 as_root() {
   if [[ "$(id -u)" == 0 ]]; then
     "$@"
-  elif command -v sudo >/dev/null; then
-    sudo -- "$@"
   else
-    printf 'This needs root, and there is no sudo. As root, run:\n  %s\n' "$*" >&2
-    return 1
+    sudo -- "$@"
   fi
+}
+
+can_be_root() {
+  [[ "$(id -u)" == 0 ]] || command -v sudo >/dev/null
 }
 
 apt_get() {
@@ -49,12 +50,17 @@ package_lists_are_fresh=false
 
 try_install_packages() {
   local missing
-  mapfile -t missing < <(missing_packages "$@")
+  read -ra missing <<<"$(missing_packages "$@" | tr '\n' ' ')"
   if [[ ${#missing[@]} == 0 ]]; then
     return 0
   fi
   if ! command -v apt-get >/dev/null; then
     printf 'Not a Debian system. Install these yourself: %s\n' "${missing[*]}" >&2
+    return 1
+  fi
+  if ! can_be_root; then
+    printf 'Packages are missing, and there is no sudo. As root, run:\n  apt-get install --no-install-recommends %s\n' \
+      "${missing[*]}" >&2
     return 1
   fi
   printf 'Installing: %s\n' "${missing[*]}"
@@ -76,7 +82,7 @@ try_install_packages() {
 
 install_packages() {
   if ! try_install_packages "$@"; then
-    printf 'The packages above could not be installed; nothing was built.\n' >&2
+    printf 'Nothing was built.\n' >&2
     exit 1
   fi
 }

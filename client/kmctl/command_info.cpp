@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "client/kmctl/commands.h"
+#include "client/kmctl/device_properties.h"
 #include "client/lib/capabilities.h"
 #include "client/lib/names.h"
 
@@ -22,8 +23,9 @@ struct info_options {
   void add_to(CLI::App& command) { command.footer(examples); }
 };
 
-std::string ta_uuid() {
-  constexpr TEEC_UUID id = KEYMASTER_TA_UUID;
+constexpr TEEC_UUID keymaster_ta = KEYMASTER_TA_UUID;
+
+std::string text_of(const TEEC_UUID& id) {
   std::string text = fmt::format("{:08x}-{:04x}-{:04x}-", id.timeLow, id.timeMid, id.timeHiAndVersion);
   for (std::size_t i = 0; i < 8; ++i) {
     text += fmt::format("{}{:02x}", i == 2 ? "-" : "", id.clockSeqAndNode[i]);
@@ -87,12 +89,17 @@ int run_info(const info_options& /*options*/, const context& ctx) {
   for (const auto& algorithm : client::get_capabilities(tee.ta())) {
     algorithms.push_back(algorithm_json(algorithm));
   }
-  std::string text =
-      fmt::format("TEE      {}\nTA       {} (Keymaster)\nkmctl    {}", tee.name(), ta_uuid(), KEYMASTER_VERSION);
+  const device_properties properties = read_properties(tee.connection(), keymaster_ta);
+  const std::string ta = text_of(keymaster_ta);
+  std::string text = fmt::format("kmctl    {}\nTEE      {}{}\nTA       {} (Keymaster){}", KEYMASTER_VERSION, tee.name(),
+                                 tee_text(properties), ta, ta_text(properties));
   for (const auto& algorithm : algorithms) {
     text += algorithm_text(algorithm);
   }
-  tell(ctx, text, {{"tee", tee.name()}, {"ta", ta_uuid()}, {"version", KEYMASTER_VERSION}, {"algorithms", algorithms}});
+  json object = {{"tee", tee.name()}, {"ta", ta}, {"version", KEYMASTER_VERSION}};
+  object.update(properties_json(properties));
+  object["algorithms"] = algorithms;
+  tell(ctx, text, object);
   return 0;
 }
 

@@ -42,6 +42,11 @@ std::string embedded(const fs::path& state) {
   return "embedded:" + fs::absolute(state).string();
 }
 
+/// JSON is UTF-8 and the names of files and the texts of properties need not be: what isn't becomes U+FFFD.
+std::string dump(const json& object) {
+  return object.dump(2, ' ', false, json::error_handler_t::replace);
+}
+
 std::string hint_of(const std::exception& failed) {
   if (const auto* const of_tee = dynamic_cast<const error*>(&failed)) {
     return of_tee->hint();
@@ -78,7 +83,7 @@ tee_link::tee_link(const context& ctx) : name_(tee_name(ctx)), connection_(name_
 void tell(const context& ctx, const std::string& text, const json& object, const std::string& data_path) {
   std::FILE* const out = data_path == "-" ? stderr : stdout;
   if (ctx.json_output) {
-    fmt::print(out, "{}\n", object.dump(2));
+    fmt::print(out, "{}\n", dump(object));
   } else if (!text.empty()) {
     fmt::print(out, "{}\n", text);
   }
@@ -117,7 +122,7 @@ json failure_json(const std::exception& failed) {
 
 int tell_failure(const context& ctx, const std::exception& failed) {
   if (ctx.json_output) {
-    fmt::print(stdout, "{}\n", json{{"error", failure_json(failed)}}.dump(2));
+    fmt::print(stdout, "{}\n", dump({{"error", failure_json(failed)}}));
   } else {
     fmt::print(stderr, "kmctl: {}\n", failed.what());
     if (const std::string hint = hint_of(failed); !hint.empty()) {

@@ -28,6 +28,7 @@ struct context {
 class tee_link {
  public:
   explicit tee_link(const context& ctx);
+  [[nodiscard]] keymaster::client::connection& connection() { return connection_; }
   [[nodiscard]] keymaster::client::session& ta() { return session_; }
   [[nodiscard]] const std::string& name() const { return name_; }
 

@@ -37,20 +37,10 @@ struct begin_request {
 /// A rule looks at one parameter of the key and answers KM_ERROR_OK or its refusal.
 using begin_rule = keymaster_error_t (*)(begin_request& request, const keymaster_key_param_t& param);
 
-keymaster_error_t offer_purpose(begin_request& request, const keymaster_key_param_t& param) {
-  request.purpose.offer(param.enumerated);
-  return KM_ERROR_OK;
-}
-keymaster_error_t offer_padding(begin_request& request, const keymaster_key_param_t& param) {
-  request.padding.offer(param.enumerated);
-  return KM_ERROR_OK;
-}
-keymaster_error_t offer_block_mode(begin_request& request, const keymaster_key_param_t& param) {
-  request.block_mode.offer(param.enumerated);
-  return KM_ERROR_OK;
-}
-keymaster_error_t offer_digest(begin_request& request, const keymaster_key_param_t& param) {
-  request.digest.offer(param.enumerated);
+/// What the key lists may be what the request asks for.
+template <requirement begin_request::*Asked>
+keymaster_error_t offer(begin_request& request, const keymaster_key_param_t& param) {
+  (request.*Asked).offer(param.enumerated);
   return KM_ERROR_OK;
 }
 
@@ -128,10 +118,10 @@ struct tag_rule {
 /// Tags that aren't here say nothing about begin.
 constexpr std::array<tag_rule, 12> begin_rules = {{
     {KM_TAG_MIN_MAC_LENGTH, check_min_mac_length},
-    {KM_TAG_PADDING, offer_padding},
-    {KM_TAG_BLOCK_MODE, offer_block_mode},
-    {KM_TAG_DIGEST, offer_digest},
-    {KM_TAG_PURPOSE, offer_purpose},
+    {KM_TAG_PADDING, offer<&begin_request::padding>},
+    {KM_TAG_BLOCK_MODE, offer<&begin_request::block_mode>},
+    {KM_TAG_DIGEST, offer<&begin_request::digest>},
+    {KM_TAG_PURPOSE, offer<&begin_request::purpose>},
     {KM_TAG_USER_SECURE_ID, check_secure_id},
     {KM_TAG_ACTIVE_DATETIME, check_active},
     {KM_TAG_MIN_SECONDS_BETWEEN_OPS, check_rate},

@@ -17,6 +17,20 @@ TEE_Result marshal_all(const keymaster_key_param_set_t& characteristics, secret_
   return TEE_SUCCESS;
 }
 
+TEE_Result refuse_total(uint32_t expected, uint32_t actual) {
+  TRACE_ERROR("Unmatched total size, expected: %d actual: %d\n", expected, actual);
+  return TEE_ERROR_GENERIC;
+}
+
+/// Moves `out` on by the `length` bytes that the platform says it wrote. More than there was room for is a wrong total,
+/// found early.
+TEE_Result take_written(byte_writer& out, uint32_t length) {
+  std::span<uint8_t> written;
+  if (out.reserve(length, written)) return TEE_SUCCESS;
+  const uint32_t before = blob_header_size + out.written();
+  return refuse_total(before + out.remaining(), before + length);
+}
+
 /// Encrypts one piece of the plaintext to the end of `out`.
 TEE_Result encrypt_piece(const operation_handle& cipher, std::span<const uint8_t> piece, byte_writer& out) {
   uint32_t length = out.remaining();
@@ -26,8 +40,7 @@ TEE_Result encrypt_piece(const operation_handle& cipher, std::span<const uint8_t
     TRACE_ERROR("AEUpdate failed with 0x%08x\n", r);
     return r;
   }
-  std::span<uint8_t> written;
-  return out.reserve(length, written) ? TEE_SUCCESS : TEE_ERROR_GENERIC;
+  return take_written(out, length);
 }
 
 TEE_Result finish_encryption(const operation_handle& cipher, std::span<uint8_t> tag, byte_writer& out) {
@@ -43,8 +56,7 @@ TEE_Result finish_encryption(const operation_handle& cipher, std::span<uint8_t> 
     TRACE_ERROR("Wrong tag size, expect %dB, got %dB", blob_tag_size, length);
     return TEE_ERROR_GENERIC;
   }
-  std::span<uint8_t> written;
-  return out.reserve(length, written) ? TEE_SUCCESS : TEE_ERROR_GENERIC;
+  return take_written(out, length);
 }
 
 /// Seals into `sealed`, which has exactly the size of the blob.
@@ -71,12 +83,9 @@ TEE_Result seal(std::span<const uint8_t> key_data, std::span<const uint8_t> mars
   if (TEE_Result r = finish_encryption(cipher, sealed.subspan(blob_tag_offset, blob_tag_size), out); r != TEE_SUCCESS) {
     return r;
   }
+  const uint32_t expected = static_cast<uint32_t>(sealed.size());
   const uint32_t total = blob_header_size + out.written();
-  if (total != sealed.size()) {
-    TRACE_ERROR("Unmatched total size, expected: %d actual: %d\n", static_cast<uint32_t>(sealed.size()), total);
-    return TEE_ERROR_GENERIC;
-  }
-  return TEE_SUCCESS;
+  return total == expected ? TEE_SUCCESS : refuse_total(expected, total);
 }
 
 }  // namespace

@@ -108,8 +108,7 @@ enum keymaster_key_format_t : uint32_t {
   KM_KEY_FORMAT_RAW = 3,    ///< import
 };
 
-/// Error codes of the public definitions that the system answers. 15 is not an error: begin succeeded but update and
-/// finish need an auth token bound to the operation.
+/// Error codes of the public definitions that the system answers.
 enum keymaster_error_t : int32_t {
   KM_ERROR_OK = 0,
   KM_ERROR_UNSUPPORTED_PURPOSE = -2,

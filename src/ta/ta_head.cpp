@@ -4,7 +4,7 @@
 #include "ta/ta_limits.h"
 #include "tee_ta_image.h"
 
-extern "C" __attribute__((section(".ta_head"), used)) const tee_ta_head ta_head = {
+extern "C" __attribute__((used)) const tee_ta_head ta_head = {
     KEYMASTER_TA_UUID,
     keymaster::ta_stack_size,
     TEE_TA_FLAG_USER_MODE | TEE_TA_FLAG_EXEC_DDR | TEE_TA_FLAG_SINGLE_INSTANCE | TEE_TA_FLAG_MULTI_SESSION,

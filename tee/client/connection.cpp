@@ -45,7 +45,10 @@ std::filesystem::path state_folder_of(const char* name) {
 
 std::filesystem::path default_state_folder() {
   if (const char* folder = environment("KEYMASTER_STATE")) return folder;
-  if (const char* states = environment("XDG_STATE_HOME")) return std::filesystem::path(states) / "keymaster";
+  // The XDG Base Directory rules have a relative path ignored.
+  const char* const states = environment("XDG_STATE_HOME");
+  if (states != nullptr && std::filesystem::path(states).is_absolute())
+    return std::filesystem::path(states) / "keymaster";
   return home_folder() / ".local" / "state" / "keymaster";
 }
 

@@ -33,7 +33,7 @@ TEE_Result TEE_AllocateOperation(TEE_OperationHandle* operation, uint32_t algori
     self.next_operation += 16;
     self.operations.emplace(self.next_operation, std::move(made));
     // An opaque number, as the API has it.
-    *operation = reinterpret_cast<TEE_OperationHandle>(self.next_operation);  // NOLINT(performance-no-int-to-ptr)
+    *operation = reinterpret_cast<TEE_OperationHandle>(self.next_operation);
   });
 }
 

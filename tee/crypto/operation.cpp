@@ -34,7 +34,7 @@ bool takes_type(const algorithm& kind, std::uint32_t mode, const object_type& ty
 
 void operation_deleter::operator()(operation* op) const {
   delete op;
-}  // NOLINT(cppcoreguidelines-owning-memory)
+}
 
 TEE_OperationInfo operation::info() const {
   const bool keyless = kind_.key_type == 0;

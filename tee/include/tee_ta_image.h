@@ -46,8 +46,15 @@ typedef struct {
   const char* text;
 } tee_ta_property;
 
-/// The image's header record and its properties; the table ends with an entry whose name is null.
-extern const tee_ta_head TA_EXPORT ta_head;
+#if defined(__GNUC__)
+#define TA_HEAD_SECTION __attribute__((section(".ta_head")))
+#else
+#define TA_HEAD_SECTION
+#endif
+
+/// The image's header record and its properties; the table ends with an entry whose name is null. The section belongs
+/// to the declaration: a definition in a section of its own would be another variable's to some compilers.
+extern const tee_ta_head TA_EXPORT TA_HEAD_SECTION ta_head;
 extern const tee_ta_property TA_EXPORT ta_properties[];
 
 #ifdef __cplusplus

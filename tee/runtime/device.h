@@ -4,9 +4,11 @@
 
 #include <array>
 #include <cstdint>
+#include <filesystem>
 #include <map>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "tee/runtime/clocks.h"
 #include "tee/runtime/faults.h"
@@ -48,6 +50,7 @@ class device_services {
   std::array<std::uint8_t, 32> boot_seed{};
   std::map<std::string, std::string, std::less<>> text_properties;  ///< of TEE_PROPSET_TEE_IMPLEMENTATION
   session_service* other_tas = nullptr;
+  std::vector<std::filesystem::path> ta_folders;  ///< where the images of TAs lie
 
   std::unique_ptr<object_store> private_store;
   std::unique_ptr<object_store> rpmb_store;  ///< null: a device without RPMB

@@ -22,10 +22,9 @@ instance_heap::instance_heap(std::uint32_t limit) : limit_(limit) {}
 
 // What is left belonged to a TA that panicked or forgot it; it may be secret.
 instance_heap::~instance_heap() {
-  for (const auto& [block, info] : blocks_) {
-    void* memory = const_cast<void*>(block);
-    OPENSSL_cleanse(memory, info.size);
-    std::free(memory);
+  for (const heap_block& block : blocks_.slots()) {
+    if (block.memory != nullptr) OPENSSL_cleanse(block.memory, block.size);
+    std::free(block.memory);
   }
 }
 
@@ -34,7 +33,7 @@ void* instance_heap::take(std::uint32_t size, bool zero, std::uint64_t bytes_aft
   void* block = std::malloc(std::max(size, 1U));
   if (block == nullptr) return nullptr;
   try {
-    blocks_.emplace(block, block_info{size, zero});
+    blocks_.insert({block, size, zero});
   } catch (const std::bad_alloc&) {
     std::free(block);
     return nullptr;
@@ -49,34 +48,34 @@ void* instance_heap::allocate(std::uint32_t size, bool zero) {
   return take(size, zero, bytes_ + charge(size));
 }
 
-void instance_heap::release(void* block, const block_info& info) {
-  if (on_free_) on_free_({static_cast<const std::uint8_t*>(block), info.size});
-  blocks_.erase(block);
-  std::free(block);
+void instance_heap::release(const heap_block& block) {
+  if (on_free_) on_free_({static_cast<const std::uint8_t*>(block.memory), block.size});
+  blocks_.erase(block.memory);
+  std::free(block.memory);
 }
 
 void* instance_heap::reallocate(void* block, std::uint32_t new_size) {
-  const auto found = blocks_.find(block);
-  if (found == blocks_.end()) return nullptr;
-  const block_info old = found->second;
+  const heap_block* found = blocks_.find(block);
+  if (found == nullptr) return nullptr;
+  const heap_block old = *found;
   void* moved = take(new_size, old.zero, bytes_ - charge(old.size) + charge(new_size));
   if (moved == nullptr) return nullptr;
   std::memcpy(moved, block, std::min(old.size, new_size));
-  release(block, old);
+  release(old);
   return moved;
 }
 
 bool instance_heap::free(void* block) {
-  const auto found = blocks_.find(block);
-  if (found == blocks_.end()) return false;
-  const block_info info = found->second;
-  bytes_ -= static_cast<std::uint32_t>(charge(info.size));
-  release(block, info);
+  const heap_block* found = blocks_.find(block);
+  if (found == nullptr) return false;
+  const heap_block old = *found;
+  bytes_ -= static_cast<std::uint32_t>(charge(old.size));
+  release(old);
   return true;
 }
 
 bool instance_heap::owns(const void* block) const {
-  return blocks_.contains(block);
+  return blocks_.find(block) != nullptr;
 }
 
 }  // namespace hosted_tee

@@ -5,8 +5,9 @@
 #include <cstdint>
 #include <functional>
 #include <span>
-#include <unordered_map>
 #include <utility>
+
+#include "tee/runtime/block_table.h"
 
 namespace hosted_tee {
 
@@ -36,14 +37,10 @@ class instance_heap {
   [[nodiscard]] std::uint32_t limit() const { return limit_; }
 
  private:
-  struct block_info {
-    std::uint32_t size;  // as requested
-    bool zero;
-  };
-  void release(void* block, const block_info& info);
+  void release(const heap_block& block);
   [[nodiscard]] void* take(std::uint32_t size, bool zero, std::uint64_t bytes_after);
 
-  std::unordered_map<const void*, block_info> blocks_;
+  block_table blocks_;
   inspector on_free_;
   std::uint32_t limit_;
   std::uint32_t bytes_ = 0;

@@ -65,14 +65,6 @@ property_value value_of(const tee_ta_property& property) {
   }
 }
 
-std::optional<property_value> of_ta(const instance& self, std::string_view name) {
-  if (name == "gpd.ta.appID") return self.uuid;
-  for (const tee_ta_property* p = self.properties; p != nullptr && p->name != nullptr; ++p) {
-    if (name == p->name) return value_of(*p);
-  }
-  return std::nullopt;
-}
-
 std::string base64(const binary_block& block) {
   std::string text((block.size() + 2) / 3 * 4, '\0');
   EVP_EncodeBlock(reinterpret_cast<unsigned char*>(text.data()), block.data(), static_cast<int>(block.size()));
@@ -99,9 +91,18 @@ struct text_maker {
 
 std::optional<property_value> find_property(const instance& self, TEE_PropSetHandle set, std::string_view name) {
   if (set == TEE_PROPSET_TEE_IMPLEMENTATION) return of_implementation(self.device, name);
-  if (set == TEE_PROPSET_CURRENT_TA) return of_ta(self, name);
+  if (set == TEE_PROPSET_CURRENT_TA) return find_ta_property(self.uuid, self.properties, name);
   if (set != TEE_PROPSET_CURRENT_CLIENT) panic("the property set is none of the three");
   if (name == "gpd.client.identity") return self.client;
+  return std::nullopt;
+}
+
+std::optional<property_value> find_ta_property(const TEE_UUID& ta, const tee_ta_property* table,
+                                               std::string_view name) {
+  if (name == "gpd.ta.appID") return ta;
+  for (const tee_ta_property* p = table; p != nullptr && p->name != nullptr; ++p) {
+    if (name == p->name) return value_of(*p);
+  }
   return std::nullopt;
 }
 

@@ -1,8 +1,12 @@
 // Properties of the Internal Core API 1.1.2 (4.4).
 #include <cstring>
+#include <stdexcept>
 
+#include "tee/runtime/device.h"
 #include "tee/runtime/platform_call.h"
 #include "tee/runtime/property.h"
+#include "tee/runtime/ta_image.h"
+#include "tee/runtime/uuid.h"
 
 namespace hosted_tee {
 namespace {
@@ -35,7 +39,29 @@ TEE_Result put(const void* data, std::size_t size, void* buffer, std::uint32_t* 
   return TEE_SUCCESS;
 }
 
+std::unique_ptr<ta_image> image_of(const TEE_UUID& ta, device_services& device) {
+  try {
+    std::unique_ptr<ta_image> image = find_ta(ta, device.ta_folders);
+    if (image == nullptr) throw call_failure(TEE_ERROR_ITEM_NOT_FOUND);
+    return image;
+  } catch (const std::runtime_error& error) {
+    device.trace.add(
+        {"TEE", trace_level::error, "get_ta_property", 0, "the TA " + to_text(ta) + " can't be read: " + error.what()});
+    throw call_failure(TEE_ERROR_BAD_FORMAT);
+  }
+}
+
 }  // namespace
+
+TEE_Result get_ta_property(const TEE_UUID& ta, const char* name, char* value, std::uint32_t* length) {
+  return platform_call("get_ta_property", length, [&](const instance& self) {
+    const std::unique_ptr<ta_image> image = image_of(ta, self.device);
+    const auto found = find_ta_property(image->parts().head->uuid, image->parts().properties, name);
+    if (!found) throw call_failure(TEE_ERROR_ITEM_NOT_FOUND);
+    const std::string text = property_text(*found);
+    return put(text.c_str(), text.size() + 1, value, length);
+  });
+}
 
 extern "C" {
 

@@ -90,8 +90,7 @@ class secure_world {
   /// identifiers are ignored.
   virtual void close_session(std::uint32_t session) = 0;
 
-  /// The device's parts, for tests and for `kmctl info`. A test touches them between calls, never during one of another
-  /// thread.
+  /// The device's parts, for tests. A test touches them between calls, never during one of another thread.
   [[nodiscard]] virtual device_services& device() = 0;
   [[nodiscard]] virtual bool has_rpmb() const = 0;  ///< whether there is RPMB storage and it passed its check
   [[nodiscard]] virtual clocks& clock() = 0;

@@ -11,6 +11,7 @@
 #include <system_error>
 
 #include "tee/runtime/hex.h"
+#include "tee/runtime/platform_call.h"
 #include "tee/runtime/property.h"
 #include "tee/runtime/secure_world.h"
 #include "tee/runtime/uuid.h"
@@ -19,6 +20,8 @@ namespace hosted_tee {
 namespace {
 
 constexpr unsigned layout_version = 1;
+
+using preparation = std::function<void(const device_record&)>;
 
 [[noreturn]] void corrupt(const std::filesystem::path& file, const std::string& why) {
   throw world_error(world_fault::corrupt, file.string() + ": " + why);
@@ -84,24 +87,25 @@ void read_lines(const std::filesystem::path& file, std::string_view content, Tak
 }
 
 void wipe(std::string& text) {
-  OPENSSL_cleanse(&text[0], text.size());
+  OPENSSL_cleanse(text.data(), text.size());
 }
 
-device_record make_device(const std::filesystem::path& file, const step_observer& step) {
+device_record make_device(const std::filesystem::path& file, const step_observer& step, const preparation& prepare) {
   device_record device{random_uuid(), {}};
   if (RAND_bytes(device.key.data(), static_cast<int>(device.key.size())) != 1) {
     throw world_error(world_fault::io, "libcrypto has no random bytes");
   }
+  prepare(device);
   std::string text = "device-id = " + to_text(device.id) + "\nstorage-key = " + to_hex(device.key) + "\n";
   write_durably(file, text, step);
   wipe(text);
   return device;
 }
 
-device_record load_device(const std::filesystem::path& folder, const step_observer& step) {
+device_record load_device(const std::filesystem::path& folder, const step_observer& step, const preparation& prepare) {
   const std::filesystem::path file = folder / "device";
   std::optional<std::string> content = read_file(file);
-  if (!content) return make_device(file, step);
+  if (!content) return make_device(file, step, prepare);
   std::optional<TEE_UUID> id;
   std::optional<storage_key> key;
   read_lines(file, *content, [&](std::string_view name, std::string_view value) {
@@ -133,16 +137,19 @@ device_settings load_settings(const std::filesystem::path& folder) {
 
 }  // namespace
 
-state_folder::state_folder(const std::filesystem::path& path, const step_observer& step) : path_(path) {
+state_folder::state_folder(const std::filesystem::path& path, const step_observer& step, const preparation& prepare)
+    : path_(path) {
   try {
     make_folder(path_);
     lock_ = take_lock(path_);
-    remove_leftovers(path_);
     check_version(path_, step);
-    device_ = load_device(path_, step);
+    remove_leftovers(path_);
+    device_ = load_device(path_, step, prepare);
     settings_ = load_settings(path_);
   } catch (const std::system_error& error) {
     throw world_error(world_fault::io, error.what());
+  } catch (const call_failure&) {
+    throw world_error(world_fault::io, path_.string() + " can't be written");
   }
 }
 

@@ -9,6 +9,7 @@
 #define TEE_RUNTIME_STATE_FOLDER_H_
 
 #include <filesystem>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
@@ -38,7 +39,10 @@ struct device_settings {
 /// world_error; a crash at any of its steps leaves a folder that the next one completes.
 class state_folder {
  public:
-  state_folder(const std::filesystem::path& path, const step_observer& step);
+  ///
+  /// `prepare` is called for a new device before it is recorded: what it writes is there whenever the device is.
+  state_folder(const std::filesystem::path& path, const step_observer& step,
+               const std::function<void(const device_record&)>& prepare);
 
   [[nodiscard]] const std::filesystem::path& path() const { return path_; }
   [[nodiscard]] const device_record& device() const { return device_; }

@@ -9,6 +9,7 @@
 #include <stdexcept>
 #include <system_error>
 
+#include "tee/runtime/device_information.h"
 #include "tee/runtime/durable_file.h"
 #include "tee/runtime/uuid.h"
 
@@ -16,7 +17,7 @@ namespace hosted_tee {
 namespace {
 
 std::vector<builtin_ta>& builtin_tas() {
-  static std::vector<builtin_ta> tas;
+  static std::vector<builtin_ta> tas{device_information_ta()};
   return tas;
 }
 

@@ -28,7 +28,6 @@ void format_into(std::string& text, const char* format, std::va_list arguments) 
   std::array<char, 256> short_text;
   std::va_list again;
   va_copy(again, arguments);
-  // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): every caller has started the list
   const int length = std::vsnprintf(short_text.data(), short_text.size(), format, arguments);
   if (length < 0) {
     text.assign(format);
@@ -36,6 +35,7 @@ void format_into(std::string& text, const char* format, std::va_list arguments) 
     text.assign(short_text.data(), static_cast<std::size_t>(length));
   } else {
     text.resize(static_cast<std::size_t>(length));
+    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): va_copy above is not seen as a start
     (void)std::vsnprintf(text.data(), text.size() + 1, format, again);
   }
   va_end(again);

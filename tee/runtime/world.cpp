@@ -24,17 +24,21 @@ std::array<std::uint8_t, 32> draw_boot_seed() {
   return seed;
 }
 
-std::unique_ptr<object_store> open_store(const state_folder& folder, const char* name, bool detects_rollback,
-                                         fault_plan& faults) {
-  const auto step = [&faults](std::string_view reached) { faults.on_storage_step(reached); };
+store_options private_options(const step_observer& step) {
+  return {"private", false, step};
+}
+store_options rpmb_options(const step_observer& step) {
+  return {"rpmb", true, step};
+}
+
+std::unique_ptr<object_store> open_store(const state_folder& folder, const store_options& options) {
+  const std::string file = (folder.path() / options.name).string() + ".db: ";
   try {
-    return std::make_unique<object_store>(folder.path(), folder.device().key,
-                                          store_options{name, detects_rollback, step});
+    return std::make_unique<object_store>(folder.path(), folder.device().key, options);
   } catch (const database_failure& failure) {
-    const std::string file = (folder.path() / name).string() + ".db: ";
     throw world_error(failure.damaged() ? world_fault::corrupt : world_fault::io, file + failure.what());
   } catch (const call_failure&) {
-    throw world_error(world_fault::io, (folder.path() / name).string() + ": can't be written");
+    throw world_error(world_fault::io, file + "can't be written");
   } catch (const std::system_error& error) {
     throw world_error(world_fault::io, error.what());
   }
@@ -47,8 +51,10 @@ object_key key_of(const TEE_UUID& ta, std::string_view id) {
 }  // namespace
 
 world::world(const world_options& options)
-    : folder_(options.state, options.at_storage_step),
-      ta_folders_(folders_of(options)),
+    : folder_(options.state, options.at_storage_step,
+              [&](const device_record& made) {
+                object_store::prepare(options.state, made.key, rpmb_options(options.at_storage_step));
+              }),
       heap_limit_(options.heap_limit) {
   const device_settings& settings = folder_.settings();
   device_.faults.at_storage_step(options.at_storage_step);
@@ -56,9 +62,11 @@ world::world(const world_options& options)
   device_.boot_seed = options.boot_seed ? *options.boot_seed : draw_boot_seed();
   device_.text_properties = settings.text_properties;
   device_.other_tas = this;
-  device_.private_store = open_store(folder_, "private", false, device_.faults);
+  device_.ta_folders = folders_of(options);
+  const auto step = [this](std::string_view reached) { device_.faults.on_storage_step(reached); };
+  device_.private_store = open_store(folder_, private_options(step));
   if (options.rpmb.value_or(settings.rpmb.value_or(true))) {
-    device_.rpmb_store = open_store(folder_, "rpmb", true, device_.faults);
+    device_.rpmb_store = open_store(folder_, rpmb_options(step));
   }
 }
 

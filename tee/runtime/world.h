@@ -68,7 +68,6 @@ class world final : public secure_world, private session_service {
 
   mutable std::mutex mutex_;
   state_folder folder_;
-  std::vector<std::filesystem::path> ta_folders_;
   std::optional<std::uint32_t> heap_limit_;
   device_services device_;
   instance_heap::inspector free_inspector_;

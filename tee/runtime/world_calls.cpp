@@ -129,7 +129,7 @@ void world::end(ta_instance& ta) {
 
 TEE_Result world::start_instance(const TEE_UUID& ta, ta_instance*& target) {
   try {
-    std::unique_ptr<ta_image> image = find_ta(ta, ta_folders_);
+    std::unique_ptr<ta_image> image = find_ta(ta, device_.ta_folders);
     if (image == nullptr) return TEE_ERROR_ITEM_NOT_FOUND;
     const std::uint32_t declared = image->number_property("gpd.ta.dataSize").value_or(ta_instance::default_heap);
     instances_.push_back(

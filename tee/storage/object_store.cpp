@@ -50,6 +50,10 @@ class digester {
   evp_digest_context context_;
 };
 
+std::filesystem::path counter_file(const std::filesystem::path& folder, const store_options& options) {
+  return folder / (options.name + ".counter");
+}
+
 }  // namespace
 
 object_store::object_store(const std::filesystem::path& folder, const storage_key& key, store_options options)
@@ -59,7 +63,7 @@ object_store::object_store(const std::filesystem::path& folder, const storage_ke
     open_database(file);
     return;
   }
-  guard_.emplace(folder / (options_.name + ".counter"), key, options_.step);
+  guard_.emplace(counter_file(folder, options_), key, options_.step);
   try {
     open_database(file);
     rolled_back_ = !guard_->accept(current_state());
@@ -67,6 +71,14 @@ object_store::object_store(const std::filesystem::path& folder, const storage_ke
     if (failure.code() != TEE_ERROR_CORRUPT_OBJECT && failure.code() != TEE_ERROR_SECURITY) throw;
     rolled_back_ = true;
   }
+}
+
+void object_store::prepare(const std::filesystem::path& folder, const storage_key& key, const store_options& options) {
+  database_state empty;
+  digester digest;
+  digest.add_number(empty.counter);
+  empty.digest = digest.finish();
+  rollback_guard(counter_file(folder, options), key, options.step).start(empty);
 }
 
 void object_store::open_database(const std::filesystem::path& file) {
@@ -128,6 +140,11 @@ std::optional<std::uint32_t> object_store::size(const object_key& key) {
   if (!row.step()) return std::nullopt;
   if (row.number(0) < sealer::overhead) throw call_failure(TEE_ERROR_CORRUPT_OBJECT);
   return static_cast<std::uint32_t>(row.number(0) - sealer::overhead);
+}
+
+bool object_store::contains(const object_key& key) {
+  require_usable();
+  return keyed(*db_, "SELECT 1 FROM objects WHERE ta = ?1 AND id = ?2", key).step();
 }
 
 void object_store::change(const std::function<void()>& statements) {

@@ -49,11 +49,16 @@ class object_store {
   /// check(); any other throws database_failure when its file is damaged.
   object_store(const std::filesystem::path& folder, const storage_key& key, store_options options);
 
+  /// prepare writes what a store that detects rollback needs to find when it is opened for the first time: without it,
+  /// or after it was deleted, such a store is taken for a rolled back one. For a device that is being made.
+  static void prepare(const std::filesystem::path& folder, const storage_key& key, const store_options& options);
+
   /// check answers TEE_SUCCESS, or TEE_ERROR_SECURITY when the content is not the latest that this device wrote.
   [[nodiscard]] TEE_Result check();
 
   [[nodiscard]] std::optional<secret_bytes> read(const object_key& key);   ///< nothing: absent
   [[nodiscard]] std::optional<std::uint32_t> size(const object_key& key);  ///< of the data; nothing: absent
+  [[nodiscard]] bool contains(const object_key& key);                      ///< also when it is corrupt
   void write(const object_key& key, std::span<const std::uint8_t> data);   ///< creates or replaces
   void remove(const object_key& key);
   void rename(const object_key& from, const std::string& new_id);  ///< the new identifier must be free

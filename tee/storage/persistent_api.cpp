@@ -42,8 +42,7 @@ TEE_Result create_object(instance& self, std::uint32_t storage, const object_key
   require_known(flags, access_and_share_flags | TEE_DATA_FLAG_OVERWRITE);
   object_store& store = store_of(self, storage);
   if (!store.handles_on(key).empty()) return TEE_ERROR_ACCESS_CONFLICT;
-  const bool exists = store.size(key).has_value();
-  if (exists && (flags & TEE_DATA_FLAG_OVERWRITE) == 0) return TEE_ERROR_ACCESS_CONFLICT;
+  if ((flags & TEE_DATA_FLAG_OVERWRITE) == 0 && store.contains(key)) return TEE_ERROR_ACCESS_CONFLICT;
   auto created = std::make_unique<persistent_object>(store, key, flags & access_and_share_flags);
   store.write(key, data);
   *object = self.objects.insert(std::move(created));

@@ -86,7 +86,7 @@ void persistent_object::seek(std::int64_t position) {
 }
 
 void persistent_object::rename(const std::string& new_id) {
-  if (store_.size({key_.ta, new_id})) throw call_failure(TEE_ERROR_ACCESS_CONFLICT);
+  if (store_.contains({key_.ta, new_id})) throw call_failure(TEE_ERROR_ACCESS_CONFLICT);
   store_.rename(key_, new_id);
   store_.forget_handle(key_, flags_);
   key_.id = new_id;

@@ -61,11 +61,14 @@ void rollback_guard::write(const record& content) const {
   }
 }
 
+void rollback_guard::start(const database_state& empty) {
+  write({empty, std::nullopt});
+}
+
 bool rollback_guard::accept(const database_state& state) {
   const std::optional<record> content = read();
-  const bool latest = content ? state == content->settled || state == content->announced : state.counter == 0;
-  if (!latest) return false;
-  if (!content || content->announced) write({state, std::nullopt});
+  if (!content || (state != content->settled && state != content->announced)) return false;
+  if (content->announced) write({state, std::nullopt});
   settled_ = state;
   return true;
 }

@@ -28,9 +28,13 @@ class rollback_guard {
  public:
   rollback_guard(std::filesystem::path file, const storage_key& key, step_observer step);
 
-  /// accept tells whether `state` is the latest, and settles on it. A missing file is one that was never written, and
-  /// goes with a database that was never written. False: rolled back or tampered with. Throws call_failure, with
-  /// TEE_ERROR_SECURITY when the file does not authenticate.
+  /// start writes the first record of a device that is being made; `empty` is the state of an empty database. Throws
+  /// call_failure.
+  void start(const database_state& empty);
+
+  /// accept tells whether `state` is the latest, and settles on it. False: rolled back or tampered with; also when the
+  /// file is missing, since every device begins with one. Throws call_failure, with TEE_ERROR_SECURITY when the file
+  /// does not authenticate.
   [[nodiscard]] bool accept(const database_state& state);
 
   /// is_settled_at tells whether `state` is the one that was accepted or settled last.
