@@ -1,0 +1,191 @@
+// What the command line becomes: descriptions of keys, parameters of operations, and what is shown of them.
+#include <gtest/gtest.h>
+
+#include "client/kmctl/application.h"
+#include "client/kmctl/authorization_options.h"
+#include "client/kmctl/describe.h"
+#include "client/kmctl/exit_codes.h"
+#include "client/kmctl/openssl_command.h"
+
+namespace {
+
+using namespace keymaster;
+using namespace kmctl;
+using client::authorizations;
+using client::bytes;
+
+authorizations parse(option_use use, const std::string& line) {
+  CLI::App app;
+  authorization_options options;
+  options.add_to(app, use);
+  app.parse(line);
+  return options.given();
+}
+
+const authorizations rsa_2048 = authorizations{}.algorithm(KM_ALGORITHM_RSA).key_size(2048).rsa_public_exponent(65537);
+
+TEST(KeyOptions, NothingSaidIsASoundSigningKey) {
+  EXPECT_EQ(with_defaults({}, option_use::generate), authorizations(rsa_2048)
+                                                         .purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY})
+                                                         .digest({KM_DIGEST_SHA_2_256})
+                                                         .padding({KM_PAD_RSA_PKCS1_1_5_SIGN})
+                                                         .no_auth_required());
+}
+
+TEST(KeyOptions, WhatIsSaidStandsInPlaceOfTheDefault) {
+  const auto all =
+      with_defaults(authorizations{}.key_size(4096).digest({KM_DIGEST_SHA1, KM_DIGEST_NONE}), option_use::generate);
+  EXPECT_EQ(all.unique_number(KM_TAG_KEY_SIZE), 4096U);
+  EXPECT_EQ(all.numbers(KM_TAG_DIGEST), (std::vector<std::uint64_t>{2, 0}));
+  EXPECT_EQ(all.count(KM_TAG_ALGORITHM), 1U);
+}
+
+TEST(KeyOptions, AnImportedKeyBringsItsOwnSizeAndExponent) {
+  const auto all = with_defaults(authorizations{}.algorithm(KM_ALGORITHM_RSA), option_use::import);
+  EXPECT_FALSE(all.contains(KM_TAG_KEY_SIZE));
+  EXPECT_FALSE(all.contains(KM_TAG_RSA_PUBLIC_EXPONENT));
+  EXPECT_TRUE(all.contains(KM_TAG_PADDING));
+}
+
+TEST(KeyOptions, RawPaddingGoesWithoutADigest) {
+  const auto all = with_defaults(authorizations{}.padding({KM_PAD_NONE}), option_use::generate);
+  EXPECT_EQ(all.numbers(KM_TAG_DIGEST), std::vector<std::uint64_t>{KM_DIGEST_NONE});
+}
+
+TEST(KeyOptions, AKeyWithAUserNeedsAuthentication) {
+  EXPECT_FALSE(
+      with_defaults(authorizations{}.user_secure_id(1), option_use::generate).contains(KM_TAG_NO_AUTH_REQUIRED));
+}
+
+TEST(KeyOptions, EveryOptionBecomesItsTag) {
+  EXPECT_EQ(
+      parse(option_use::generate,
+            "--algorithm rsa --size 2048 --exponent 0x10001 --purpose sign,verify --digest sha-256,none --padding pss "
+            "--block-mode gcm --caller-nonce --min-mac-length 96 --active 2030-01-01 --origination-expire 2031-01-01 "
+            "--usage-expire 2032-01-01 --max-uses-per-boot 3 --min-seconds-between-ops 4 --bootloader-only "
+            "--no-auth-required --user-secure-id 5,6 --user-auth-type fingerprint --auth-timeout 7"),
+      authorizations(rsa_2048)
+          .purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY})
+          .digest({KM_DIGEST_SHA_2_256, KM_DIGEST_NONE})
+          .padding({KM_PAD_RSA_PSS})
+          .block_mode({KM_MODE_GCM})
+          .caller_nonce()
+          .min_mac_length(96)
+          .add(KM_TAG_ACTIVE_DATETIME, std::uint64_t{1893456000000})
+          .add(KM_TAG_ORIGINATION_EXPIRE_DATETIME, std::uint64_t{1924992000000})
+          .add(KM_TAG_USAGE_EXPIRE_DATETIME, std::uint64_t{1956528000000})
+          .max_uses_per_boot(3)
+          .min_seconds_between_ops(4)
+          .add(KM_TAG_BOOTLOADER_ONLY, std::uint64_t{1})
+          .no_auth_required()
+          .user_secure_id(5)
+          .user_secure_id(6)
+          .user_auth_type(2)
+          .auth_timeout(7));
+}
+
+TEST(KeyOptions, AListMayBeGivenInPieces) {
+  EXPECT_EQ(parse(option_use::generate, "--digest sha-1,sha-256 --digest none").numbers(KM_TAG_DIGEST),
+            (std::vector<std::uint64_t>{KM_DIGEST_SHA1, KM_DIGEST_SHA_2_256, KM_DIGEST_NONE}));
+}
+
+TEST(KeyOptions, ValuesThatDontFitAreRefused) {
+  EXPECT_THROW(parse(option_use::generate, "--digest sha-1,sha-3"), usage_error);
+  EXPECT_THROW(parse(option_use::generate, "--size 1024 --size 2048"), CLI::ParseError);
+  EXPECT_THROW(parse(option_use::generate, "--digest sha-3"), usage_error);
+  EXPECT_THROW(parse(option_use::generate, "--size 4294967296"), usage_error);
+  EXPECT_THROW(parse(option_use::generate, "--active yesterday"), usage_error);
+  EXPECT_THROW(parse(option_use::generate, "--mac-length 96"), CLI::ParseError);
+  EXPECT_THROW(parse(option_use::operation, "--purpose sign"), CLI::ParseError);
+}
+
+TEST(OperationParameters, TheOnlyChoiceOfTheKeyIsTaken) {
+  const auto key = authorizations(rsa_2048)
+                       .padding({KM_PAD_RSA_PKCS1_1_5_SIGN, KM_PAD_RSA_OAEP})  // OAEP does not sign
+                       .digest({KM_DIGEST_SHA_2_384});
+  EXPECT_EQ(operation_parameters({}, key),
+            authorizations{}.padding({KM_PAD_RSA_PKCS1_1_5_SIGN}).digest({KM_DIGEST_SHA_2_384}));
+}
+
+TEST(OperationParameters, AChoiceIsTheUsers) {
+  const auto key =
+      authorizations(rsa_2048).padding({KM_PAD_RSA_PKCS1_1_5_SIGN, KM_PAD_RSA_PSS}).digest({KM_DIGEST_SHA_2_256});
+  try {
+    (void)operation_parameters({}, key);
+    FAIL();
+  } catch (const usage_error& refused) {
+    EXPECT_STREQ(refused.what(), "the key allows more than one padding: pkcs1-1-5-sign, pss");
+    EXPECT_EQ(refused.hint(), "say which one with --padding");
+  }
+  EXPECT_EQ(operation_parameters(authorizations{}.padding({KM_PAD_RSA_PSS}), key),
+            authorizations{}.padding({KM_PAD_RSA_PSS}).digest({KM_DIGEST_SHA_2_256}));
+  EXPECT_THROW((void)operation_parameters({}, rsa_2048), usage_error);
+}
+
+TEST(OperationParameters, RawPaddingTakesNoDigestWhateverTheKeyLists) {
+  const auto key = authorizations(rsa_2048).padding({KM_PAD_NONE}).digest({KM_DIGEST_SHA_2_256, KM_DIGEST_NONE});
+  EXPECT_EQ(operation_parameters({}, key), authorizations{}.padding({KM_PAD_NONE}).digest({KM_DIGEST_NONE}));
+}
+
+TEST(OperationParameters, OtherAlgorithmsNeedWhatTheyNeed) {
+  EXPECT_EQ(operation_parameters({}, authorizations{}.algorithm(KM_ALGORITHM_EC).digest({KM_DIGEST_SHA_2_256})),
+            authorizations{}.digest({KM_DIGEST_SHA_2_256}));
+  EXPECT_EQ(operation_parameters(
+                {}, authorizations{}.algorithm(KM_ALGORITHM_HMAC).digest({KM_DIGEST_SHA_2_256}).min_mac_length(128)),
+            authorizations{}.mac_length(128));
+}
+
+TEST(Describe, GroupsRepeatedTagsAndNamesValues) {
+  const auto list = authorizations(rsa_2048)
+                        .purpose({KM_PURPOSE_SIGN})
+                        .digest({KM_DIGEST_NONE, KM_DIGEST_SHA_2_256})
+                        .no_auth_required()
+                        .add(KM_TAG_ACTIVE_DATETIME, std::uint64_t{1893456000000})
+                        .application_id(bytes{0xAB, 0x01})
+                        .add(0x30001234, std::uint64_t{9});
+  EXPECT_EQ(describe_text(list),
+            "  algorithm                   rsa\n"
+            "  key-size                    2048\n"
+            "  rsa-public-exponent         65537\n"
+            "  purpose                     sign\n"
+            "  digest                      none, sha-256\n"
+            "  no-auth-required            yes\n"
+            "  active-datetime             2030-01-01T00:00:00Z\n"
+            "  application-id              ab01\n"
+            "  tag-0x30001234              9");
+  EXPECT_EQ(describe_json(list), json::parse(R"({
+    "algorithm": "rsa", "key_size": 2048, "rsa_public_exponent": 65537, "purpose": ["sign"],
+    "digest": ["none", "sha-256"], "no_auth_required": true, "active_datetime": "2030-01-01T00:00:00Z",
+    "application_id": "ab01", "tag_0x30001234": 9})"));
+  EXPECT_EQ(key_title(list), "RSA-2048");
+  EXPECT_EQ(key_title({}), "UNKNOWN");
+}
+
+TEST(CommandLine, EverySubCommandTeaches) {
+  context ctx;
+  const auto app = make_application(ctx);
+  const auto commands = app->get_subcommands([](const CLI::App*) { return true; });
+  ASSERT_EQ(commands.size(), 10U);
+  for (const CLI::App* const command : commands) {
+    EXPECT_FALSE(command->get_description().empty());
+    EXPECT_NE(command->get_footer().find("kmctl " + command->get_name()), std::string::npos) << command->get_name();
+  }
+  for (const char* const code : {"  0  ", "  1  ", "  2  ", "  3  ", "  4  ", "  5  ", "  6  "}) {
+    EXPECT_NE(app->help().find(code), std::string::npos) << code;
+  }
+}
+
+TEST(OpensslCommand, IsPrintedAsAShellTakesIt) {
+  EXPECT_EQ(command_line({"openssl", "a b", "it's", "", "x=/y"}), "openssl 'a b' 'it'\\''s' '' x=/y");
+  EXPECT_EQ(verify_command("p.pem", "s", "-f").back(), "./-f");
+}
+
+TEST(OpensslCommand, GivesStatusAndOutput) {
+  const auto done = run_command({"sh", "-c", "echo out; echo err >&2; exit 7"});
+  EXPECT_EQ(done.status, 7);
+  EXPECT_EQ(done.output, "out\nerr\n");
+  EXPECT_EQ(run_command({"sh", "-c", "kill -9 $$"}).status, 128 + 9);
+  EXPECT_THROW((void)run_command({"/does/not/exist"}), failure_error);
+}
+
+}  // namespace

@@ -1,0 +1,142 @@
+// Every allocation and every platform call of every scenario fails once. A command whose platform failed must fail
+// itself, leave nothing behind, spoil nothing of other operations, and work again the next time.
+#include <fmt/format.h>
+
+#include "tests/faults/stage.h"
+
+using namespace keymaster;
+
+namespace testing_support {
+namespace {
+
+/// An operation that has nothing to do with the scenario and must come through it.
+class bystander {
+ public:
+  explicit bystander(stage& on) : on_(on) {
+    const bytes blob = on.client().must_import(rsa_key(1024), on.key.material());
+    handle_ = on.client().must_begin(KM_PURPOSE_SIGN, blob, signature(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PSS));
+  }
+  void feed() {
+    const bytes piece = pattern(3, static_cast<std::uint32_t>(fed_.size()));
+    ASSERT_TRUE(on_.client().update(handle_, piece).ok());
+    fed_.insert(fed_.end(), piece.begin(), piece.end());
+  }
+  void finish() {
+    const finish_answer done = on_.client().finish(handle_);
+    ASSERT_TRUE(done.ok());
+    EXPECT_TRUE(on_.key.verifies(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PSS, fed_, done.data));
+  }
+
+ private:
+  stage& on_;
+  std::uint32_t handle_ = 0;
+  bytes fed_;
+};
+
+class CommandSweepTest : public ::testing::TestWithParam<scenario> {
+ protected:
+  const scenario& play = GetParam();
+  stage on{play.rpmb};
+  hosted_tee::fault_plan& faults = on.tee.world().faults();
+  hosted_tee::accounting baseline;
+  std::uint32_t counted_allocations = 0, counted_calls = 0;
+
+  void expect_baseline() {
+    const hosted_tee::accounting now = on.tee.accounting();
+    EXPECT_EQ(now.heap_bytes, baseline.heap_bytes);
+    EXPECT_EQ(now.heap_blocks, baseline.heap_blocks);
+    EXPECT_EQ(now.transient_objects, baseline.transient_objects);
+    EXPECT_EQ(now.persistent_objects, baseline.persistent_objects);
+    EXPECT_EQ(now.operations, baseline.operations);
+  }
+
+  /// A failed command tells so in both places, and has no response.
+  void expect_failed(const answer& got) const {
+    EXPECT_TRUE(got.result != TEEC_SUCCESS || got.error != KM_ERROR_OK);
+    EXPECT_NE(got.error, KM_ERROR_OK);
+    EXPECT_NE(got.result, TEEC_ERROR_TARGET_DEAD);
+    EXPECT_EQ(got.size, 0U);
+    if (play.zeroes_response) {
+      EXPECT_EQ(got.output, bytes(got.output.size(), 0));
+    }
+  }
+
+  /// run_clean plays without a fault and counts what could have failed.
+  void run_clean() {
+    if (play.approach) play.approach(on);
+    faults.clear();
+    const answer got = play.run(on);
+    counted_allocations = faults.allocations();
+    counted_calls = faults.fallible_calls();
+    EXPECT_EQ(got.result, play.result);
+    EXPECT_EQ(got.error, play.error);
+    if (!got.ok()) expect_failed(got);
+    if (got.ok() && play.settle) play.settle(on, got);
+    expect_baseline();
+  }
+
+  /// run_faulty plays with a fault, and once more without.
+  template <class Order>
+  void run_faulty(Order&& order) {
+    if (play.approach) play.approach(on);
+    faults.clear();
+    order();
+    const answer got = play.run(on);
+    EXPECT_TRUE(faults.triggered());
+    faults.clear();
+    expect_failed(got);
+    expect_baseline();
+    run_clean();
+  }
+
+  /// expect_whole_pool: 16 operations at a time are still possible.
+  void expect_whole_pool() {
+    for (const std::uint32_t handle : on.fillers) EXPECT_TRUE(on.client().abort(handle).ok());
+    const bytes blob = on.client().must_import(rsa_key(1024), on.key.material());
+    const param_list raw = signature(KM_DIGEST_NONE, KM_PAD_NONE);
+    for (int i = 0; i < 16; ++i) EXPECT_TRUE(on.client().begin(KM_PURPOSE_SIGN, blob, raw).ok()) << i;
+    EXPECT_EQ(on.client().begin(KM_PURPOSE_SIGN, blob, raw).error, KM_ERROR_TOO_MANY_OPERATIONS);
+  }
+};
+
+constexpr TEE_Result platform_failures[] = {TEE_ERROR_GENERIC, TEE_ERROR_OUT_OF_MEMORY, TEE_ERROR_BAD_PARAMETERS};
+
+TEST_P(CommandSweepTest, FailsCleanlyWhateverFailsBelow) {
+  play.arrange(on);
+  bystander other(on);
+  baseline = on.tee.accounting();
+  run_clean();
+  run_clean();  // and counted here, when whatever the first run set up for good is there
+  const std::uint32_t allocations = counted_allocations, calls = counted_calls;
+  RecordProperty("allocations", static_cast<int>(allocations));
+  RecordProperty("platform_calls", static_cast<int>(calls));
+
+  for (std::uint32_t n = 1; n <= allocations && !HasFailure(); ++n) {
+    SCOPED_TRACE(fmt::format("allocation {} of {} fails", n, allocations));
+    run_faulty([&] { faults.fail_allocation(n); });
+    other.feed();
+  }
+  for (const TEE_Result result : platform_failures) {
+    for (std::uint32_t n = 1; n <= calls && !HasFailure(); ++n) {
+      SCOPED_TRACE(fmt::format("platform call {} of {} fails with {:#x}", n, calls, result));
+      run_faulty([&] { faults.fail_any_call(n, result); });
+      other.feed();
+    }
+  }
+  other.finish();
+  expect_whole_pool();
+}
+
+std::vector<scenario> all_scenarios() {
+  std::vector<scenario> all;
+  for (const auto& some : {key_scenarios(), begin_scenarios(), step_scenarios(), finish_scenarios()}) {
+    all.insert(all.end(), some.begin(), some.end());
+  }
+  return all;
+}
+
+INSTANTIATE_TEST_SUITE_P(Every, CommandSweepTest, ::testing::ValuesIn(all_scenarios()),
+                         [](const auto& played) { return std::string(played.param.name); });
+
+}  // namespace
+}  // namespace testing_support
