@@ -6,7 +6,6 @@
 #include <cstring>
 #include <deque>
 #include <random>
-#include <set>
 
 #include "tests/support/ta_scope.h"
 

@@ -31,8 +31,7 @@ bytes CommandTest::import_fixed(unsigned bits, const param_list& params) {
 }
 
 bytes CommandTest::stored_ksk() {
-  const std::string name("Keymaster KSK", 14);
-  const auto value = tee.world().read_object(keymaster_ta, TEE_STORAGE_RPMB, name);
+  const auto value = tee.world().read_object(keymaster_ta, TEE_STORAGE_RPMB, stored_ksk_name);
   if (!value) throw std::runtime_error("the device has no key storage key");
   return {value->begin(), value->end()};
 }

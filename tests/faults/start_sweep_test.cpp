@@ -12,7 +12,6 @@ using namespace keymaster;
 namespace testing_support {
 namespace {
 
-const std::string ksk_object("Keymaster KSK", 14);
 constexpr TEE_Result ksk_deleted = 0xF0100001;
 
 /// The situations that a start can meet.
@@ -30,10 +29,10 @@ void PrintTo(const start_scenario& play, std::ostream* out) {
 
 void as_it_is(hosted_tee::secure_world&) {}
 void without_a_key(hosted_tee::secure_world& world) {
-  world.delete_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object);
+  world.delete_object(keymaster_ta, TEE_STORAGE_RPMB, stored_ksk_name);
 }
 void with_a_malformed_key(hosted_tee::secure_world& world) {
-  world.write_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object, "too short");
+  world.write_object(keymaster_ta, TEE_STORAGE_RPMB, stored_ksk_name, "too short");
 }
 
 class StartSweepTest : public ::testing::TestWithParam<start_scenario> {

@@ -11,7 +11,6 @@ namespace {
 
 using trace_lines = std::vector<std::string>;
 
-const std::string ksk_object("Keymaster KSK", 14);
 constexpr TEE_Result ksk_deleted = 0xF0100001;
 
 struct start_failure {
@@ -59,9 +58,13 @@ class StartTest : public DeviceTest {
     }
   }
 
-  std::optional<std::string> stored() { return tee.world().read_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object); }
-  void store(std::string_view value) { tee.world().write_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object, value); }
-  void remove_key() { tee.world().delete_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object); }
+  std::optional<std::string> stored() {
+    return tee.world().read_object(keymaster_ta, TEE_STORAGE_RPMB, stored_ksk_name);
+  }
+  void store(std::string_view value) {
+    tee.world().write_object(keymaster_ta, TEE_STORAGE_RPMB, stored_ksk_name, value);
+  }
+  void remove_key() { tee.world().delete_object(keymaster_ta, TEE_STORAGE_RPMB, stored_ksk_name); }
 
   const std::string code = " failed with 0xffff0001";
   const std::string derived = "Init derived KSK" + code, rpmb = "Init RPMB KSK" + code;

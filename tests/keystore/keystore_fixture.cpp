@@ -89,11 +89,11 @@ void KeystoreTest::TearDown() {
 }
 
 std::optional<std::string> KeystoreTest::stored_ksk() {
-  return world_->read_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object);
+  return world_->read_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_id);
 }
 
 void KeystoreTest::store_ksk(const bytes& data) {
-  world_->write_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_object, std::string(data.begin(), data.end()));
+  world_->write_object(keymaster_ta, TEE_STORAGE_RPMB, ksk_id, std::string(data.begin(), data.end()));
 }
 
 bytes KeystoreTest::derived_value() const {

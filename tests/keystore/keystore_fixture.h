@@ -14,9 +14,6 @@
 
 namespace testing_support {
 
-/// The identifier of the stored KSK, with its terminating zero.
-inline constexpr std::string_view ksk_object{"Keymaster KSK", 14};
-
 /// seal makes a blob with libcrypto alone: the key is HMAC-SHA256(ksk, nonce), the cipher AES-256-GCM without
 /// associated data.
 [[nodiscard]] bytes seal(std::uint8_t protection, const bytes& ksk, const bytes& nonce, const bytes& iv,
@@ -59,6 +56,8 @@ class KeystoreTest : public ::testing::Test {
   [[nodiscard]] hosted_tee::fault_plan& faults() { return world_->faults(); }
   [[nodiscard]] std::vector<std::string> errors() const { return ta_->errors(); }
 
+  /// The identifier of the stored KSK, with its terminating zero.
+  static constexpr std::string_view ksk_id{"Keymaster KSK", 14};
   [[nodiscard]] std::optional<std::string> stored_ksk();
   void store_ksk(const bytes& data);
 

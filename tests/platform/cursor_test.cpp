@@ -22,7 +22,13 @@ class exact_bytes {
   explicit exact_bytes(const bytes& data) : block_(new std::uint8_t[data.size()]), size_(data.size()) {
     std::copy(data.begin(), data.end(), block_.get());
   }
-  [[nodiscard]] std::span<std::uint8_t> span() const { return {block_.get(), size_}; }
+  [[nodiscard]] std::span<std::uint8_t> span() const {
+    // The compiler must not know the size: it would warn of the very accesses that the cursors are to refuse.
+    std::uint8_t* data = block_.get();
+    std::size_t size = size_;
+    asm volatile("" : "+r"(data), "+r"(size));
+    return {data, size};
+  }
   [[nodiscard]] bytes content() const { return {block_.get(), block_.get() + size_}; }
 
  private:
@@ -129,14 +135,13 @@ TEST(ByteReaderTest, ABlockThatRunsPastTheEndMovesNothingNotEvenItsLength) {
 }
 
 TEST(ByteReaderTest, CopiesFitOrAreNotMade) {
-  const exact_bytes data(from_hex("a0a1a2a3"));
+  const exact_bytes data(from_hex("a0a1a2a3")), target(bytes(4, 0xEE));
   byte_reader in{data.span()};
-  bytes target(4, 0xEE);
-  EXPECT_FALSE(in.copy_to(target.data(), 5));
-  for (const std::uint32_t length : huge_lengths) EXPECT_FALSE(in.copy_to(target.data(), length));
-  EXPECT_EQ(target, bytes(4, 0xEE));
-  ASSERT_TRUE(in.copy_to(target.data(), 3));
-  EXPECT_EQ(to_hex(target), "a0a1a2ee");
+  EXPECT_FALSE(in.copy_to(target.span().data(), 5));
+  for (const std::uint32_t length : huge_lengths) EXPECT_FALSE(in.copy_to(target.span().data(), length));
+  EXPECT_EQ(target.content(), bytes(4, 0xEE));
+  ASSERT_TRUE(in.copy_to(target.span().data(), 3));
+  EXPECT_EQ(to_hex(target.content()), "a0a1a2ee");
   EXPECT_EQ(in.remaining(), 1U);
   EXPECT_TRUE(in.copy_to(nullptr, 0)) << "nothing needs no place";
 }

@@ -6,6 +6,7 @@
 
 #include <filesystem>
 #include <memory>
+#include <string_view>
 
 #include "tee/runtime/secure_world.h"
 #include "tests/support/ta_client.h"
@@ -17,6 +18,9 @@ inline constexpr TEE_Time start_system = {7200, 250};        // two hours after 
 inline constexpr TEE_Time start_ree = {1'700'000'000, 500};  // November 2023
 
 inline constexpr TEE_UUID keymaster_ta = KEYMASTER_TA_UUID;
+
+/// The name of the TA's object in the RPMB storage, its terminating zero included: the key storage key.
+inline constexpr std::string_view stored_ksk_name{"Keymaster KSK\0", 14};
 
 /// A folder that is removed with the test.
 class temporary_folder {

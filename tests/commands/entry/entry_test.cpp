@@ -1,4 +1,5 @@
 // The entry points called directly, for what a platform between client and TA would not let through.
+#include <fmt/format.h>
 #include <gmock/gmock.h>
 
 #include "params/keymaster_protocol.h"
@@ -66,10 +67,9 @@ TEST_F(EntryTest, TheSessionContextIsTracedAndLeftAlone) {
   EXPECT_EQ(context, &nothing);
   ta.clear_trace();
   EXPECT_EQ(TA_InvokeCommandEntryPoint(context, 0, 0, none), TEE_ERROR_BAD_PARAMETERS);
-  std::array<char, 128> line = {};
-  std::snprintf(line.data(), line.size(),
-                "TA_InvokeCommandEntryPoint nCommandID 0x0 pSessionContext %p nParamTypes 0x0\n", context);
-  EXPECT_THAT(ta.traced(trace_level::info), testing::ElementsAre(line.data()));
+  EXPECT_THAT(ta.traced(trace_level::info),
+              testing::ElementsAre(fmt::format(
+                  "TA_InvokeCommandEntryPoint nCommandID 0x0 pSessionContext {} nParamTypes 0x0\n", context)));
   ta.clear_trace();
   TA_CloseSessionEntryPoint(context);
   EXPECT_TRUE(device.trace.lines().empty());

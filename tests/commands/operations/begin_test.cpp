@@ -20,6 +20,12 @@ class BeginTest : public CommandTest {
     return client().call(KM_COMMAND_BEGIN, KM_PURPOSE_SIGN, 0, body, capacity);
   }
 
+  std::vector<std::uint32_t> fill_the_pool() {
+    std::vector<std::uint32_t> handles(16);
+    for (std::uint32_t& handle : handles) handle = client().must_begin(KM_PURPOSE_VERIFY, blob, raw);
+    return handles;
+  }
+
   /// expect_refused begins with `params` and expects the failure, with no handle.
   void expect_refused(const failure& expected, std::uint32_t purpose, const bytes& key, const param_list& params) {
     const answer a = expect_failure(expected, [&] { return client().begin(purpose, key, params); });
@@ -137,8 +143,7 @@ TEST_F(BeginTest, TheNeedOfATokenIsForgottenWhenTheConstructorFails) {
 }
 
 TEST_F(BeginTest, TheSeventeenthOperationIsRefusedUntilOneEnds) {
-  std::vector<std::uint32_t> handles;
-  for (int i = 0; i < 16; ++i) handles.push_back(client().must_begin(KM_PURPOSE_VERIFY, blob, raw));
+  const std::vector<std::uint32_t> handles = fill_the_pool();
   EXPECT_EQ(std::set<std::uint32_t>(handles.begin(), handles.end()).size(), 16U);
   expect_refused(refused(KM_ERROR_TOO_MANY_OPERATIONS, {"Too many operations", "Allocate in operation pool failed"}),
                  KM_PURPOSE_VERIFY, blob, raw);
@@ -151,8 +156,7 @@ TEST_F(BeginTest, TheSeventeenthOperationIsRefusedUntilOneEnds) {
 
 TEST_F(BeginTest, ARefusedSeventeenthBeginHasUsedUpAUse) {
   const bytes limited = import_fixed(512, rsa_key(512).add(KM_TAG_MAX_USES_PER_BOOT, 1));
-  std::vector<std::uint32_t> handles;
-  for (int i = 0; i < 16; ++i) handles.push_back(client().must_begin(KM_PURPOSE_VERIFY, blob, raw));
+  const std::vector<std::uint32_t> handles = fill_the_pool();
   EXPECT_EQ(client().begin(KM_PURPOSE_SIGN, limited, raw).error, KM_ERROR_TOO_MANY_OPERATIONS);
   EXPECT_TRUE(client().abort(handles.front()).ok());
   expect_refused(refused(KM_ERROR_KEY_MAX_OPS_EXCEEDED, {"Key max ops exceeded", "Authorization failed"}),

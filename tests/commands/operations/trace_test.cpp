@@ -37,7 +37,7 @@ TEST_F(TraceTest, EverySetThatComesInIsDumpedOnce) {
   EXPECT_EQ(dumps([&] { return client().export_key(blob, id); }), 1);
   std::uint32_t handle = 0;
   EXPECT_EQ(dumps([&] {
-              const answer begun = client().begin(KM_PURPOSE_SIGN, blob, scheme);
+              answer begun = client().begin(KM_PURPOSE_SIGN, blob, scheme);
               handle = begun.b;
               return begun;
             }),
