@@ -13,7 +13,7 @@ using namespace hosted_tee;
 
 constexpr TEEC_UUID device_information_ta = DEVICE_INFORMATION_TA_UUID;
 constexpr std::size_t usual_size = 256;
-constexpr std::size_t longest_value = 64 * 1024;  // far beyond any property; a longer one is not an answer
+constexpr std::size_t longest_value = 65536;  // far beyond any property; a longer one is not an answer
 
 TEEC_Parameter input(byte_view data) {
   TEEC_Parameter slot{};
