@@ -18,8 +18,8 @@ namespace keymaster {
 inline constexpr keymaster_error_t KM_OP_AUTH_NEEDED = static_cast<keymaster_error_t>(15);
 
 /// authorizaiton_init reads the clocks, makes the key that auth tokens are checked with, and the two tables. On failure
-/// nothing is left behind; the result is the platform's, or TEE_ERROR_OUT_OF_MEMORY. (The name is spelt as the trace
-/// and its readers know it.)
+/// nothing is left behind; the result is the platform's, or TEE_ERROR_OUT_OF_MEMORY. (The name's spelling is that of
+/// the interface.)
 [[nodiscard]] TEE_Result authorizaiton_init();
 
 /// authorizaiton_release frees what authorizaiton_init made.

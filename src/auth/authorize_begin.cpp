@@ -74,8 +74,8 @@ keymaster_error_t check_active(begin_request&, const keymaster_key_param_t& para
   return KM_ERROR_KEY_NOT_YET_VALID;
 }
 
-/// Compares the wall clock with a use that was recorded by the system clock. Keys in the field rely on how the two mix:
-/// where the wall clock is far ahead, the limit never refuses.
+/// Compares the wall clock with a use that was recorded by the system clock. The two mix on purpose: where the wall
+/// clock is far ahead, the limit never refuses.
 keymaster_error_t check_rate(begin_request& request, const keymaster_key_param_t& param) {
   uint32_t last_use = 0;
   if (!use_log_last_use(request.blob, &last_use)) return KM_ERROR_OK;

@@ -28,7 +28,8 @@ bool is_remembered(uint32_t handle) {
   return std::any_of(pool.begin(), pool.end(), [handle](const pool_slot& slot) { return slot.handle == handle; });
 }
 
-/// Draws until the handle is usable. The loop ends: at most 17 of 2^32 values are refused.
+/// Draws until the handle is usable. At most 17 of 2^32 values are refused, so the loop ends as soon as the random
+/// source varies.
 uint32_t draw_handle() {
   uint32_t handle = 0;
   do {

@@ -1,5 +1,7 @@
 #include "keystore/key_blob_layout.h"
 
+#include <utility>
+
 #include "platform/trace.h"
 
 namespace keymaster {

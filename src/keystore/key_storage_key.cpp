@@ -158,6 +158,7 @@ void key_store_release() {
 }
 
 TEE_Result key_store_init_derived_ksk() {
+  drop(the_derived_ksk);
   TEE_UUID device_id;
   wiped_array<ksk_size> value;
   std::memset(value.bytes, derived_ksk_fill, ksk_size);
@@ -184,6 +185,7 @@ int judge_rpmb() {
 }
 
 TEE_Result key_store_init_rpmb_ksk() {
+  drop(the_rpmb_ksk);
   persistent_object stored;
   object_handle ksk;
   TEE_Result result = stored.open(KSK_STORAGE_ID, ksk_object_id, ksk_object_id_length, TEE_DATA_FLAG_ACCESS_READ);

@@ -1,4 +1,6 @@
 #include "keystore/key_blob.h"
+
+#include <cstring>
 #include "keystore/key_blob_layout.h"
 #include "params/dump.h"
 #include "params/marshal.h"

@@ -1,4 +1,6 @@
 #include "keystore/key_blob.h"
+
+#include <cstring>
 #include "keystore/key_blob_layout.h"
 #include "params/marshal.h"
 #include "platform/cursor.h"
@@ -52,7 +54,7 @@ TEE_Result finish_encryption(const operation_handle& cipher, std::span<uint8_t> 
     return r;
   }
   if (tag_length != blob_tag_size) {
-    // The second number is the ciphertext's byte count and not the tag's: log readers know the line in this form.
+    // The second number is the ciphertext's byte count and not the tag's: the line stays comparable with older logs.
     TRACE_ERROR("Wrong tag size, expect %dB, got %dB", blob_tag_size, length);
     return TEE_ERROR_GENERIC;
   }

@@ -70,12 +70,6 @@ struct constant_list {
   }
 };
 
-/// default_error turns a failure that says nothing into KM_ERROR_UNKNOWN_ERROR: both codes zero would look like
-/// success.
-inline void default_error(bool failed, TEE_Result result, keymaster_error_t* error) {
-  if (failed && result == TEE_SUCCESS && *error == KM_ERROR_OK) *error = KM_ERROR_UNKNOWN_ERROR;
-}
-
 }  // namespace keymaster
 
 #endif  // KEYMASTER_PARAMS_ALGORITHM_H_

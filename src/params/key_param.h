@@ -85,7 +85,7 @@ struct keymaster_key_param_set_t {
 
 /// key_param_set_append adds a copy of `parameter`, whose blob (if it has one) the set owns from then on in either
 /// case. KM_ERROR_MEMORY_ALLOCATION_FAILED: the set is unchanged and the blob has been freed. Pointers into the set's
-/// array are invalid afterwards; `parameter` may be one of them.
+/// array are invalid afterwards; `parameter` may be one of them if it has no blob.
 [[nodiscard]] keymaster_error_t key_param_set_append(keymaster_key_param_set_t* set,
                                                      const keymaster_key_param_t& parameter);
 

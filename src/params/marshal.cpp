@@ -1,6 +1,7 @@
 #include "params/marshal.h"
 
 #include <algorithm>
+#include <cstring>
 
 #include "platform/bytes.h"
 #include "platform/cursor.h"
@@ -66,8 +67,9 @@ TEE_Result unmarshal_records(std::span<const uint8_t> input, parameter_set& set)
   return TEE_SUCCESS;
 }
 
-/// Clears the place where a 64-bit client's record keeps the upper half of its data reference, seen from the data area.
-/// The blob's bytes then cover it, unless they are fewer than 12. It never reaches past the buffer.
+/// Clears four bytes at offset 8 of the data area before a blob is written there, a trait of the format that readers of
+/// short blobs see: the blob's bytes cover it, unless they are fewer than 12. It never reaches past the marshalled
+/// size.
 void clear_reference_remainder(std::span<uint8_t> data_area) {
   constexpr std::size_t offset = 8, size = 4;
   if (data_area.size() <= offset) return;

@@ -89,7 +89,8 @@ TEE_Result create(uint32_t purpose, std::span<const uint8_t> key_data, parameter
   operation.reset(ops->create_operation({key_data, characteristics, in_params, out_params}, &result, error));
   if (!operation) {
     TRACE_ERROR("Create operation failed");
-    default_error(true, result, error);
+    // A failure that says nothing: both codes zero would look like success.
+    if (result == TEE_SUCCESS && *error == KM_ERROR_OK) *error = KM_ERROR_UNKNOWN_ERROR;
     return result;
   }
   operation->purpose = purpose;

@@ -43,26 +43,22 @@ offered_list find_format_list(uint32_t algorithm, format_list select) {
   return descriptor == nullptr ? offered_list{} : select(*descriptor);
 }
 
-TEE_Result count_list(const offered_list& offered, keymaster_error_t missing, uint32_t* count,
-                      keymaster_error_t* error) {
+void count_list(const offered_list& offered, keymaster_error_t missing, uint32_t* count, keymaster_error_t* error) {
   *count = offered.count == nullptr ? 0 : offered.count();
   *error = offered.count == nullptr ? missing : KM_ERROR_OK;
-  return TEE_SUCCESS;
 }
 
-/// Writes a list; `no_list` is traced for one that has a count only.
-TEE_Result write_list(const offered_list& offered, keymaster_error_t missing, const char* no_list,
-                      std::span<uint8_t> list, keymaster_error_t* error) {
+/// Writes a list. TEE_ERROR_GENERIC: there is a count only, and the caller says whose list is missing.
+TEE_Result write_list(const offered_list& offered, keymaster_error_t missing, std::span<uint8_t> list,
+                      keymaster_error_t* error) {
   uint32_t count = 0;
-  if (TEE_Result r = count_list(offered, missing, &count, error); r != TEE_SUCCESS || *error != KM_ERROR_OK) return r;
+  count_list(offered, missing, &count, error);
+  if (*error != KM_ERROR_OK) return TEE_SUCCESS;
   if (list.size() != uint64_t{count} * sizeof(uint32_t)) {
     TRACE_ERROR("Output buffer doesn't match");
     return TEE_ERROR_BAD_PARAMETERS;
   }
-  if (offered.copy == nullptr) {
-    TRACE_ERROR("%s", no_list);
-    return TEE_ERROR_GENERIC;
-  }
+  if (offered.copy == nullptr) return TEE_ERROR_GENERIC;
   offered.copy(reinterpret_cast<uint32_t*>(list.data()));
   return TEE_SUCCESS;
 }
@@ -86,51 +82,66 @@ TEE_Result get_support_algo(std::span<uint8_t> list) {
 }
 
 TEE_Result get_support_blk_mode_cnt(uint32_t algorithm, uint32_t purpose, uint32_t* count, keymaster_error_t* error) {
-  return count_list(find_purpose_list(algorithm, purpose, block_modes), KM_ERROR_UNSUPPORTED_PURPOSE, count, error);
+  count_list(find_purpose_list(algorithm, purpose, block_modes), KM_ERROR_UNSUPPORTED_PURPOSE, count, error);
+  return TEE_SUCCESS;
 }
 
 TEE_Result get_support_padding_mode_cnt(uint32_t algorithm, uint32_t purpose, uint32_t* count,
                                         keymaster_error_t* error) {
-  return count_list(find_purpose_list(algorithm, purpose, padding_modes), KM_ERROR_UNSUPPORTED_PURPOSE, count, error);
+  count_list(find_purpose_list(algorithm, purpose, padding_modes), KM_ERROR_UNSUPPORTED_PURPOSE, count, error);
+  return TEE_SUCCESS;
 }
 
 TEE_Result get_support_digest_cnt(uint32_t algorithm, uint32_t purpose, uint32_t* count, keymaster_error_t* error) {
-  return count_list(find_purpose_list(algorithm, purpose, digests), KM_ERROR_UNSUPPORTED_PURPOSE, count, error);
+  count_list(find_purpose_list(algorithm, purpose, digests), KM_ERROR_UNSUPPORTED_PURPOSE, count, error);
+  return TEE_SUCCESS;
 }
 
 TEE_Result get_support_blk_mode(uint32_t algorithm, uint32_t purpose, std::span<uint8_t> list,
                                 keymaster_error_t* error) {
-  return write_list(find_purpose_list(algorithm, purpose, block_modes), KM_ERROR_UNSUPPORTED_PURPOSE,
-                    "get_support_block_mode == NULL", list, error);
+  const TEE_Result result =
+      write_list(find_purpose_list(algorithm, purpose, block_modes), KM_ERROR_UNSUPPORTED_PURPOSE, list, error);
+  if (result == TEE_ERROR_GENERIC) TRACE_ERROR("get_support_block_mode == NULL");
+  return result;
 }
 
 TEE_Result get_support_padding_mode(uint32_t algorithm, uint32_t purpose, std::span<uint8_t> list,
                                     keymaster_error_t* error) {
-  return write_list(find_purpose_list(algorithm, purpose, padding_modes), KM_ERROR_UNSUPPORTED_PURPOSE,
-                    "get_support_padding_mode == NULL", list, error);
+  const TEE_Result result =
+      write_list(find_purpose_list(algorithm, purpose, padding_modes), KM_ERROR_UNSUPPORTED_PURPOSE, list, error);
+  if (result == TEE_ERROR_GENERIC) TRACE_ERROR("get_support_padding_mode == NULL");
+  return result;
 }
 
 TEE_Result get_support_digest(uint32_t algorithm, uint32_t purpose, std::span<uint8_t> list, keymaster_error_t* error) {
-  return write_list(find_purpose_list(algorithm, purpose, digests), KM_ERROR_UNSUPPORTED_PURPOSE,
-                    "get_support_digest == NULL", list, error);
+  const TEE_Result result =
+      write_list(find_purpose_list(algorithm, purpose, digests), KM_ERROR_UNSUPPORTED_PURPOSE, list, error);
+  if (result == TEE_ERROR_GENERIC) TRACE_ERROR("get_support_digest == NULL");
+  return result;
 }
 
 TEE_Result get_support_import_format_cnt(uint32_t algorithm, uint32_t* count, keymaster_error_t* error) {
-  return count_list(find_format_list(algorithm, import_formats), KM_ERROR_UNSUPPORTED_ALGORITHM, count, error);
+  count_list(find_format_list(algorithm, import_formats), KM_ERROR_UNSUPPORTED_ALGORITHM, count, error);
+  return TEE_SUCCESS;
 }
 
 TEE_Result get_support_export_format_cnt(uint32_t algorithm, uint32_t* count, keymaster_error_t* error) {
-  return count_list(find_format_list(algorithm, export_formats), KM_ERROR_UNSUPPORTED_ALGORITHM, count, error);
+  count_list(find_format_list(algorithm, export_formats), KM_ERROR_UNSUPPORTED_ALGORITHM, count, error);
+  return TEE_SUCCESS;
 }
 
 TEE_Result get_support_import_format(uint32_t algorithm, std::span<uint8_t> list, keymaster_error_t* error) {
-  return write_list(find_format_list(algorithm, import_formats), KM_ERROR_UNSUPPORTED_ALGORITHM,
-                    "get_support_import_format == NULL", list, error);
+  const TEE_Result result =
+      write_list(find_format_list(algorithm, import_formats), KM_ERROR_UNSUPPORTED_ALGORITHM, list, error);
+  if (result == TEE_ERROR_GENERIC) TRACE_ERROR("get_support_import_format == NULL");
+  return result;
 }
 
 TEE_Result get_support_export_format(uint32_t algorithm, std::span<uint8_t> list, keymaster_error_t* error) {
-  return write_list(find_format_list(algorithm, export_formats), KM_ERROR_UNSUPPORTED_ALGORITHM,
-                    "get_support_export_format == NULL", list, error);
+  const TEE_Result result =
+      write_list(find_format_list(algorithm, export_formats), KM_ERROR_UNSUPPORTED_ALGORITHM, list, error);
+  if (result == TEE_ERROR_GENERIC) TRACE_ERROR("get_support_export_format == NULL");
+  return result;
 }
 
 }  // namespace keymaster

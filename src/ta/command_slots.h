@@ -8,6 +8,7 @@
 #include "params/keymaster_defs.h"
 #include "platform/bytes.h"
 #include "platform/cursor.h"
+#include "platform/trace.h"
 #include "tee_internal_api.h"
 
 namespace keymaster {
@@ -30,7 +31,13 @@ namespace keymaster {
 
 /// copy_field copies a small field out of client memory, which may change while a command runs. False, with a trace
 /// line and KM_ERROR_MEMORY_ALLOCATION_FAILED: the heap is exhausted.
-[[nodiscard]] bool copy_field(std::span<const uint8_t> field, heap_bytes& copy, keymaster_error_t* error);
+template <bool Secret>
+[[nodiscard]] bool copy_field(std::span<const uint8_t> field, basic_bytes<Secret>& copy, keymaster_error_t* error) {
+  if (copy.copy_of(field)) return true;
+  TRACE_ERROR("Out of memory");
+  *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
+  return false;
+}
 
 }  // namespace keymaster
 

@@ -231,7 +231,7 @@ TEE_Result dispatch(uint32_t command, uint32_t param_types, TEE_Param params[4])
   }
   TRACE_INFO("%s", entry->name);
   if (param_types != entry->param_types) {
-    // The fingerprint TA's makers read the types in the trace; nobody else does.
+    // The command that another TA sends is the one whose line tells the types.
     if (command == KM_COMMAND_SOTER_SET_FID) {
       TRACE_ERROR("Bad argument type 0x%x\n", param_types);
     } else {

@@ -15,6 +15,7 @@ TEE_Result TA_CreateEntryPoint(void) {
   }
   if (TEE_Result r = keymaster::operation_pool_init(); r != TEE_SUCCESS) {
     TRACE_ERROR("Init operation pool failed");
+    keymaster::key_store_release();
     return r;
   }
   if (TEE_Result r = keymaster::authorizaiton_init(); r != TEE_SUCCESS) {

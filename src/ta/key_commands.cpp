@@ -15,7 +15,8 @@ constexpr uint32_t shortest_described_blob = 2;
 
 /// Key blob, application id, application data: what every command on an existing key sends.
 struct key_request {
-  heap_bytes blob, app_id, app_data;
+  heap_bytes blob;
+  secret_bytes app_id, app_data;  // knowing them is what opens the key
 };
 
 TEE_Result read_key_request(std::span<const uint8_t> request, key_request& key, keymaster_error_t* error) {
@@ -76,6 +77,7 @@ TEE_Result export_public_key(std::span<const uint8_t> key_data, const keymaster_
   }
   *response_length = static_cast<uint32_t>(response.size());
   const TEE_Result result = descriptor->export_key(key_data, response.data(), response_length, error);
+  if (*response_length > response.size()) *error = KM_ERROR_UNKNOWN_ERROR;  // more than can have been written
   if (result != TEE_SUCCESS || *error != KM_ERROR_OK) TRACE_ERROR("Export key failed");
   return result;
 }

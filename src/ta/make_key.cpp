@@ -1,4 +1,6 @@
 #include "keystore/key_blob.h"
+
+#include <cstring>
 #include "params/dump.h"
 #include "params/marshal.h"
 #include "platform/trace.h"

@@ -1,5 +1,7 @@
 #include "ta/operation_commands.h"
 
+#include <cstring>
+
 #include "auth/authorization.h"
 #include "auth/operation_pool.h"
 #include "params/algorithm.h"
@@ -49,6 +51,7 @@ TEE_Result run_update(keymaster_operation_t* operation, const step_arguments& ar
   *response_length = static_cast<uint32_t>(response.size());
   const TEE_Result result = operation->update(operation, arguments.in_params, arguments.input, input_consumed,
                                               response.data(), response_length, error);
+  if (*response_length > response.size()) *error = KM_ERROR_UNKNOWN_ERROR;  // more than can have been written
   if (result != TEE_SUCCESS || *error != KM_ERROR_OK) TRACE_ERROR("Update failed");
   return result;
 }

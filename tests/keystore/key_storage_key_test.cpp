@@ -191,4 +191,23 @@ TEST_F(KeyStorageKeyTest, AStartDoesNotTrustHandlesOfAnEarlierInstance) {
   EXPECT_EQ(value_of(derived_ksk()), derived_value());
 }
 
+TEST_F(KeyStorageKeyTest, EitherKeyMadeAgainReplacesTheOldOneAndAFailureLeavesNone) {
+  start_keys();
+  const auto held = ta().holdings();
+  EXPECT_EQ(key_store_init_derived_ksk(), TEE_SUCCESS);
+  EXPECT_EQ(key_store_init_rpmb_ksk(), TEE_SUCCESS);
+  expect_same(ta().holdings(), held);
+  EXPECT_EQ(value_of(derived_ksk()), derived_value());
+  EXPECT_EQ(value_of(rpmb_ksk()), rpmb_value());
+
+  faults().fail_call("TEE_GetPropertyAsUUID", 1, TEE_ERROR_GENERIC);
+  EXPECT_EQ(key_store_init_derived_ksk(), TEE_ERROR_GENERIC);
+  EXPECT_EQ(derived_ksk(), nullptr);
+  EXPECT_NE(rpmb_ksk(), nullptr);
+  faults().fail_call("TEE_OpenPersistentObject", 1, TEE_ERROR_GENERIC);
+  EXPECT_EQ(key_store_init_rpmb_ksk(), TEE_ERROR_GENERIC);
+  EXPECT_EQ(rpmb_ksk(), nullptr);
+  EXPECT_EQ(ta().holdings().transient_objects, 0U);
+}
+
 }  // namespace

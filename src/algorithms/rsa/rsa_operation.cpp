@@ -34,27 +34,17 @@ TEE_Result set_rsa_operation(rsa_operation_t& op, uint32_t algorithm, uint32_t m
   return TEE_SUCCESS;
 }
 
-keymaster_error_t gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit,
-                                 uint32_t* input_consumed, const char* too_long) {
-  const uint64_t total = uint64_t{op.buffered} + input.size();
-  if (static_cast<int64_t>(total) > limit) {
-    TRACE_ERROR(too_long, op.key_size, static_cast<uint32_t>(total));
-    *input_consumed = 0;
-    return KM_ERROR_INVALID_INPUT_LENGTH;
-  }
+bool gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit, uint32_t* total) {
+  const uint64_t sum = uint64_t{op.buffered} + input.size();
+  *total = static_cast<uint32_t>(sum);
+  if (static_cast<int64_t>(sum) > limit) return false;
   if (!input.empty()) std::memcpy(op.buffer.data() + op.buffered, input.data(), input.size());
-  op.buffered = static_cast<uint32_t>(total);
-  return KM_ERROR_OK;
+  op.buffered = *total;
+  return true;
 }
 
-void trace_incomplete(const rsa_operation_t* op, const char* is_null, const char* is_invalid) {
-  if (op == nullptr) {
-    TRACE_ERROR("%s", is_null);
-    return;
-  }
-  if (!op->key) TRACE_ERROR("%s", is_invalid);
-  if (!op->operation) TRACE_ERROR("%s", is_invalid);
-  if (!op->buffer) TRACE_ERROR("%s", is_invalid);
+uint32_t missing_members(const rsa_operation_t& op) {
+  return (op.key ? 0U : 1U) + (op.operation ? 0U : 1U) + (op.buffer ? 0U : 1U);
 }
 
 void right_align(std::span<uint8_t> block, uint32_t length) {

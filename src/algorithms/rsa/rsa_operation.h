@@ -33,11 +33,9 @@ struct rsa_operation_t : keymaster_operation_t {
 /// set_rsa_operation makes the platform's operation of `op` for `algorithm` and `mode` and gives it the key.
 [[nodiscard]] TEE_Result set_rsa_operation(rsa_operation_t& op, uint32_t algorithm, uint32_t mode);
 
-/// gather_message appends `input` to the buffer of `op` as long as no more than `limit` bytes come together. Otherwise
-/// it traces `too_long` with the key size and the would-be total, consumes nothing and answers
-/// KM_ERROR_INVALID_INPUT_LENGTH.
-[[nodiscard]] keymaster_error_t gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit,
-                                               uint32_t* input_consumed, const char* too_long);
+/// gather_message appends `input` to the buffer of `op` as long as no more than `limit` bytes come together. False:
+/// nothing was taken. `*total` is how many bytes there are, or would be.
+[[nodiscard]] bool gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit, uint32_t* total);
 
 /// finish_record hands out `op` when its set-up succeeded, and deletes it otherwise.
 template <class Record>
@@ -47,17 +45,8 @@ template <class Record>
   return nullptr;
 }
 
-/// trace_incomplete is the part of free_record that does not depend on the type.
-void trace_incomplete(const rsa_operation_t* op, const char* is_null, const char* is_invalid);
-
-/// free_record frees a record of type `Record`. `is_null` is traced when there is none, `is_invalid` for each of its
-/// indispensable members that is missing.
-template <class Record>
-void free_record(keymaster_operation_t* op, const char* is_null, const char* is_invalid) {
-  Record* const record = static_cast<Record*>(op);
-  trace_incomplete(record, is_null, is_invalid);
-  delete_record(record);
-}
+/// missing_members counts which of key, operation and buffer a record lacks; freeing it traces a line for each.
+[[nodiscard]] uint32_t missing_members(const rsa_operation_t& op);
 
 /// right_align moves the `length` bytes at the start of `block` to its end and zeros what is in front of them: the
 /// platform drops leading zeros of a number, and a number of fixed width has them.

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <utility>
 
 #include "algorithms/rsa/rsa_signature_scheme.h"
 #include "platform/trace.h"
@@ -143,9 +144,15 @@ TEE_Result rsa_sign_update(keymaster_operation_t* op, const keymaster_key_param_
                            uint32_t* output_length, keymaster_error_t* error) {
   rsa_sign_operation_t& sign = record(op);
   *output_length = 0;
-  *error = sign.soter_buffer ? gather_soter(sign, input)
-                             : update_signature_operation(sign, input, input_consumed,
-                                                          "Input too long to sign, key_size %d, input %dB");
+  *error = KM_ERROR_OK;
+  uint32_t total = 0;
+  if (sign.soter_buffer) {
+    *error = gather_soter(sign, input);
+  } else if (!update_signature_operation(sign, input, &total)) {
+    TRACE_ERROR("Input too long to sign, key_size %d, input %dB", sign.key_size, total);
+    *input_consumed = 0;
+    *error = KM_ERROR_INVALID_INPUT_LENGTH;
+  }
   return TEE_SUCCESS;
 }
 
@@ -167,8 +174,13 @@ TEE_Result rsa_sign_finish(keymaster_operation_t* op, const keymaster_key_param_
 }
 
 void rsa_sign_free(keymaster_operation_t* op) {
-  free_record<rsa_sign_operation_t>(op, "Try to free NULL rsa_sign_operation_t",
-                                    "Try to free invalid rsa_sign_operation_t");
+  auto* const sign = static_cast<rsa_sign_operation_t*>(op);
+  if (sign == nullptr) {
+    TRACE_ERROR("Try to free NULL rsa_sign_operation_t");
+    return;
+  }
+  for (uint32_t n = missing_members(*sign); n > 0; --n) TRACE_ERROR("Try to free invalid rsa_sign_operation_t");
+  delete_record(sign);
 }
 
 }  // namespace keymaster

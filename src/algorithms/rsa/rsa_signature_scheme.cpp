@@ -122,11 +122,10 @@ int64_t raw_message_limit(const rsa_operation_t& op) {
   return int64_t{op.modulus_size()} - (op.padding == KM_PAD_RSA_PKCS1_1_5_SIGN ? pkcs1_overhead : 0);
 }
 
-keymaster_error_t update_signature_operation(rsa_operation_t& op, std::span<const uint8_t> input,
-                                             uint32_t* input_consumed, const char* too_long) {
-  if (!op.digest_operation) return gather_message(op, input, raw_message_limit(op), input_consumed, too_long);
+bool update_signature_operation(rsa_operation_t& op, std::span<const uint8_t> input, uint32_t* total) {
+  if (!op.digest_operation) return gather_message(op, input, raw_message_limit(op), total);
   TEE_DigestUpdate(op.digest_operation.get(), input.data(), static_cast<uint32_t>(input.size()));
-  return KM_ERROR_OK;
+  return true;
 }
 
 bool build_pkcs1_block(rsa_operation_t& op) {

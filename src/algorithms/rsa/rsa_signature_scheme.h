@@ -32,10 +32,9 @@ struct rsa_signature_scheme {
 /// (RFC 8017, section 9.2). Negative for keys that are too short for the padding.
 [[nodiscard]] int64_t raw_message_limit(const rsa_operation_t& op);
 
-/// update_signature_operation feeds `input` to the digest of `op`, or gathers it where there is none; `too_long` is the
-/// trace line for raw input beyond the limit. Sign and verify take their messages alike.
-[[nodiscard]] keymaster_error_t update_signature_operation(rsa_operation_t& op, std::span<const uint8_t> input,
-                                                           uint32_t* input_consumed, const char* too_long);
+/// update_signature_operation feeds `input` to the digest of `op`, or gathers it where there is none: see
+/// gather_message. Sign and verify take their messages alike.
+[[nodiscard]] bool update_signature_operation(rsa_operation_t& op, std::span<const uint8_t> input, uint32_t* total);
 
 /// build_pkcs1_block makes the buffer of `op` the block 00 01 FF…FF 00 message (RFC 8017, section 9.2, without the
 /// DigestInfo: the caller signs what it wants signed). False, with the buffer as it was: the message does not fit.

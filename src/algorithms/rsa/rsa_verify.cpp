@@ -75,9 +75,15 @@ keymaster_operation_t* create_rsa_verify(const operation_request& request, TEE_R
 TEE_Result rsa_verify_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,
                              std::span<const uint8_t> input, uint32_t* input_consumed, uint8_t* /*output*/,
                              uint32_t* output_length, keymaster_error_t* error) {
+  rsa_verify_operation_t& verify = record(op);
+  uint32_t total = 0;
   *output_length = 0;
-  *error =
-      update_signature_operation(record(op), input, input_consumed, "Input too long to verify, key_size %d, input %dB");
+  *error = KM_ERROR_OK;
+  if (!update_signature_operation(verify, input, &total)) {
+    TRACE_ERROR("Input too long to verify, key_size %d, input %dB", verify.key_size, total);
+    *input_consumed = 0;
+    *error = KM_ERROR_INVALID_INPUT_LENGTH;
+  }
   return TEE_SUCCESS;
 }
 
@@ -98,8 +104,13 @@ TEE_Result rsa_verify_finish(keymaster_operation_t* op, const keymaster_key_para
 }
 
 void rsa_verify_free(keymaster_operation_t* op) {
-  free_record<rsa_verify_operation_t>(op, "Try to free NULL rsa_verify_operation_t",
-                                      "Try to free invalid rsa_verify_operation_t");
+  auto* const verify = static_cast<rsa_verify_operation_t*>(op);
+  if (verify == nullptr) {
+    TRACE_ERROR("Try to free NULL rsa_verify_operation_t");
+    return;
+  }
+  for (uint32_t n = missing_members(*verify); n > 0; --n) TRACE_ERROR("Try to free invalid rsa_verify_operation_t");
+  delete_record(verify);
 }
 
 }  // namespace keymaster

@@ -163,6 +163,15 @@ TEST_F(FalseAnswerTest, ARecoveredBlockOfAnotherLengthIsAWrongSignature) {
   }
 }
 
+TEST_F(FalseAnswerTest, AnExportOfMoreThanTheRoomIsNotHandedOut) {
+  for (const std::uint32_t length : {4097U, 5000U, 0xFFFFFFFFU}) {
+    claim("TEE_AsymmetricExport", 1, length);
+    const answer a = expect_failure(refused(KM_ERROR_UNKNOWN_ERROR, {"Export key failed"}),
+                                    [&] { return client().export_key(blob); });
+    EXPECT_EQ(a.size, 0U);
+  }
+}
+
 /// An auth token must not pass because its MAC couldn't be computed.
 class FalseTokenTest : public FalseAnswerTest {
  protected:

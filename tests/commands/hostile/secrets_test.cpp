@@ -105,15 +105,21 @@ TEST_F(SecretsTest, AKeyThatCantBeHandedOutLeavesNone) {
 }
 
 TEST_F(SecretsTest, LookingAtAKeyLeavesNone) {
-  const bytes blob = import_fixed(1024, rsa_key(1024).add_blob(KM_TAG_APPLICATION_ID, from_text("id")));
+  // Knowing the application's id and data is what opens the key: they are secrets too.
+  const bytes id = from_text("the id of an application"), data = from_text("what the application adds");
+  const bytes blob =
+      import_fixed(1024, rsa_key(1024).add_blob(KM_TAG_APPLICATION_ID, id).add_blob(KM_TAG_APPLICATION_DATA, data));
   freed.clear();
-  EXPECT_TRUE(client().characteristics_size(blob, from_text("id")).ok());
-  EXPECT_TRUE(client().characteristics(blob, from_text("id")).ok());
-  EXPECT_TRUE(client().export_key(blob, from_text("id")).ok());
+  EXPECT_TRUE(client().characteristics_size(blob, id, data).ok());
+  EXPECT_TRUE(client().characteristics(blob, id, data).ok());
+  EXPECT_TRUE(client().export_key(blob, id, data).ok());
   EXPECT_FALSE(client().characteristics(blob).ok());
-  EXPECT_FALSE(client().characteristics(blob, from_text("id"), {}, 3).ok());
-  EXPECT_FALSE(client().export_key(blob, from_text("id"), {}, 3).ok());
+  EXPECT_FALSE(client().characteristics(blob, data, id).ok());
+  EXPECT_FALSE(client().characteristics(blob, id, data, 3).ok());
+  EXPECT_FALSE(client().export_key(blob, id, data, 3).ok());
   EXPECT_TRUE(client().delete_key(blob).ok());
+  EXPECT_FALSE(freed.holds(id));
+  EXPECT_FALSE(freed.holds(data));
   expect_no_secrets({blob});
 }
 
