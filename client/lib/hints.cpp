@@ -27,8 +27,9 @@ constexpr std::array tee_advices = std::to_array<tee_advice>({
     {"connect", TEEC_ERROR_SECURITY,
      "the state does not authenticate: it was altered or copied together from two devices; restore it or choose "
      "another"},
-    {"connect", TEEC_ERROR_ITEM_NOT_FOUND, "nothing is behind this TEE name: check the name, or start the server"},
-    {"connect", TEEC_ERROR_COMMUNICATION, "nothing answers behind this TEE name: check the name, or start the server"},
+    {"connect", TEEC_ERROR_BAD_FORMAT,
+     "a text file of the state folder, most likely `settings`, can't be parsed: --trace error names the file and the "
+     "line, and docs/hosted-tee.md tells what settings may say"},
     {"connect", TEEC_ERROR_BAD_PARAMETERS, "a TEE name has the form embedded:FOLDER"},
     {"connect", TEEC_ERROR_GENERIC, "check that the state folder can be made and written, and that its disk has room"},
     {"open_session", TEEC_ERROR_ITEM_NOT_FOUND,

@@ -13,9 +13,10 @@ namespace {
 
 constexpr std::string_view embedded = "embedded:";
 
-constexpr std::array<std::pair<world_fault, TEEC_Result>, 4> fault_results{{
+constexpr std::array<std::pair<world_fault, TEEC_Result>, 5> fault_results{{
     {world_fault::busy, TEEC_ERROR_BUSY},
     {world_fault::newer, TEEC_ERROR_BAD_STATE},
+    {world_fault::malformed, TEEC_ERROR_BAD_FORMAT},
     {world_fault::corrupt, TEEC_ERROR_SECURITY},
     {world_fault::io, TEEC_ERROR_GENERIC},
 }};

@@ -11,6 +11,16 @@
 namespace hosted_tee {
 namespace {
 
+// A result alone does not tell which file is at fault. A device that does not start has no trace, so the line goes
+// where KEYMASTER_TRACE has a device's lines printed.
+void report(const std::exception& error) noexcept {
+  try {
+    trace_log().add({"TEE", trace_level::error, "client_api", 0, error.what()});
+  } catch (const std::exception&) {
+    // The result stands without its line.
+  }
+}
+
 // The one place where this library's exceptions become results.
 template <class Body>
 TEEC_Result client_call(Body&& body) noexcept {
@@ -19,10 +29,12 @@ TEEC_Result client_call(Body&& body) noexcept {
   } catch (const client_failure& failure) {
     return failure.code();
   } catch (const world_error& error) {
+    report(error);
     return result_of(error.fault());
   } catch (const std::bad_alloc&) {
     return TEEC_ERROR_OUT_OF_MEMORY;
-  } catch (const std::exception&) {
+  } catch (const std::exception& error) {
+    report(error);
     return TEEC_ERROR_GENERIC;
   }
 }

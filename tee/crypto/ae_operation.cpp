@@ -63,9 +63,12 @@ void ae_operation::decrypt_final(bytes_view source, const output& destination, b
   expect_mode(TEE_MODE_DECRYPT);
   refuse_unless(!is_poisoned(), TEE_ERROR_MAC_INVALID);
   expect_running();
-  std::uint8_t* const place = destination.room(source.size());
+  // libcrypto would be content with any part of the tag, so its length is settled first.
+  const bool has_length = tag.size() == tag_bytes_;
+  std::uint8_t* const place = has_length ? destination.room(source.size()) : nullptr;
   bool authentic = false;
   guard([&] {
+    if (!has_length) return;
     update(source, destination);
     authentic = is_authentic(tag);
   });
@@ -75,8 +78,6 @@ void ae_operation::decrypt_final(bytes_view source, const output& destination, b
 }
 
 bool ae_operation::is_authentic(bytes_view tag) {
-  // libcrypto would be content with any part of the tag, so its length is settled first.
-  if (tag.size() != tag_bytes_) return false;
   return tag.empty() || (stream_.expect_tag(tag) && stream_.close());
 }
 

@@ -20,7 +20,8 @@ class ae_operation : public multi_stage_operation {
 
   void encrypt_final(bytes_view source, const output& destination, const output& tag);
   /// decrypt_final refuses with TEE_ERROR_MAC_INVALID whatever keeps it from confirming the tag: a wrong one, one of
-  /// another length than agreed, an operation that a failed step has spoiled. Callers look for that code alone.
+  /// another length than agreed, an operation that a failed step has spoiled. Callers look for that code alone. A short
+  /// buffer is told only with a tag of the agreed length, and takes no data.
   void decrypt_final(bytes_view source, const output& destination, bytes_view tag);
 
  private:
@@ -28,7 +29,7 @@ class ae_operation : public multi_stage_operation {
   void drop_key() override;
   void copy_content(const operation& other) override;
   [[nodiscard]] std::uint32_t result_bytes() const override { return tag_bytes_; }
-  [[nodiscard]] bool is_authentic(bytes_view tag);
+  [[nodiscard]] bool is_authentic(bytes_view tag);  ///< for a tag of the agreed length
 
   secret_bytes key_;
   aes_stream stream_;

@@ -6,19 +6,20 @@
 #include <memory>
 
 #include "tee/crypto/algorithms.h"
+#include "tee_api_constants.h"
 
 namespace hosted_tee {
 
 class operation;
 
-/// Classes of operations, by the API's numbers (table 6-4).
+/// Classes of operations, by the API's numbers.
 enum class operation_class : std::uint32_t {
-  cipher = 1,
-  mac = 3,
-  ae = 4,
-  digest = 5,
-  asymmetric_cipher = 6,
-  asymmetric_signature = 7,
+  cipher = TEE_OPERATION_CIPHER,
+  mac = TEE_OPERATION_MAC,
+  ae = TEE_OPERATION_AE,
+  digest = TEE_OPERATION_DIGEST,
+  asymmetric_cipher = TEE_OPERATION_ASYMMETRIC_CIPHER,
+  asymmetric_signature = TEE_OPERATION_ASYMMETRIC_SIGNATURE,
 };
 
 struct algorithm {

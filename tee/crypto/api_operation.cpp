@@ -18,6 +18,21 @@ bool offers(const algorithm& kind, std::uint32_t mode, std::uint32_t max_bits) {
   return find_object_type(kind.key_type)->has_size(max_bits);
 }
 
+/// run_step runs a step on an operation of any class: a failure poisons one that takes its data in pieces. The others
+/// have no state to poison, and the instance panics.
+template <class Step>
+void run_step(operation& target, const std::optional<TEE_Result>& fault, Step&& step) {
+  const auto run = [&] {
+    if (fault) refuse(*fault);
+    step(target);
+  };
+  if (auto* const staged = dynamic_cast<multi_stage_operation*>(&target)) {
+    staged->guard(run);
+  } else {
+    run();
+  }
+}
+
 }  // namespace
 
 extern "C" {
@@ -53,7 +68,10 @@ void TEE_GetOperationInfo(TEE_OperationHandle operation, TEE_OperationInfo* oper
 }
 
 void TEE_ResetOperation(TEE_OperationHandle operation) {
-  platform_call_void(__func__, [&](instance& self) { find_any_operation(self, operation).reset(); });
+  platform_step(__func__, [&](const instance& self, const std::optional<TEE_Result>& fault) {
+    const error_queue_scope own_errors;
+    run_step(find_any_operation(self, operation), fault, [](hosted_tee::operation& found) { found.reset(); });
+  });
 }
 
 TEE_Result TEE_SetOperationKey(TEE_OperationHandle operation, TEE_ObjectHandle key) {
@@ -63,21 +81,18 @@ TEE_Result TEE_SetOperationKey(TEE_OperationHandle operation, TEE_ObjectHandle k
 }
 
 void TEE_CopyOperation(TEE_OperationHandle dstOperation, TEE_OperationHandle srcOperation) {
-  platform_call_void(__func__, [&](instance& self) {
+  platform_step(__func__, [&](const instance& self, const std::optional<TEE_Result>& fault) {
     const error_queue_scope own_errors;
     const auto& source = find_any_operation(self, srcOperation);
     auto& destination = find_any_operation(self, dstOperation);
     if (&source == &destination) return;
-    if (auto* const staged = dynamic_cast<multi_stage_operation*>(&destination)) {
-      staged->guard([&] { destination.copy_from(source); });
-    } else {
-      destination.copy_from(source);
-    }
+    run_step(destination, fault, [&](hosted_tee::operation& found) { found.copy_from(source); });
   });
 }
 
 void TEE_GenerateRandom(void* randomBuffer, uint32_t randomBufferLen) {
-  platform_call_void(__func__, [&](instance& /*self*/) {
+  platform_step(__func__, [&](const instance& /*self*/, const std::optional<TEE_Result>& fault) {
+    if (fault) panic("no random data to be had", *fault);
     panic_unless(randomBuffer != nullptr || randomBufferLen == 0, "no place for random data");
     constexpr std::uint32_t piece = 1U << 30U;  // libcrypto counts in int
     auto* place = static_cast<std::uint8_t*>(randomBuffer);

@@ -82,17 +82,25 @@ TEE_Result TEE_AEUpdate(TEE_OperationHandle operation, const void* srcData, uint
 
 TEE_Result TEE_AEEncryptFinal(TEE_OperationHandle operation, const void* srcData, uint32_t srcLen, void* destData,
                               uint32_t* destLen, void* tag, uint32_t* tagLen) {
-  return operation_call<ae_operation>(__func__, operation, destLen, [&](auto& ae) {
+  const TEE_Result result = operation_call<ae_operation>(__func__, operation, destLen, [&](auto& ae) {
     ae.encrypt_final(input(srcData, srcLen), output(destData, destLen), output(tag, tagLen));
   });
+  // The one call with two lengths.
+  if (result != TEE_SUCCESS && result != TEE_ERROR_SHORT_BUFFER && tagLen != nullptr) *tagLen = 0;
+  return result;
 }
 
 TEE_Result TEE_AEDecryptFinal(TEE_OperationHandle operation, const void* srcData, uint32_t srcLen, void* destData,
                               uint32_t* destLen, void* tag, uint32_t tagLen) {
   return operation_call<ae_operation>(__func__, operation, destLen, [&](auto& ae) {
-    // Also a missing tag or message is one that doesn't authenticate.
-    refuse_unless((srcData != nullptr || srcLen == 0) && (tag != nullptr || tagLen == 0), TEE_ERROR_MAC_INVALID);
-    ae.decrypt_final(input(srcData, srcLen), output(destData, destLen), input(tag, tagLen));
+    try {
+      ae.decrypt_final(input(srcData, srcLen), output(destData, destLen), input(tag, tagLen));
+    } catch (const call_failure& refusal) {
+      // Also a missing tag or message is one that doesn't authenticate.
+      refuse(refusal.code() == TEE_ERROR_SHORT_BUFFER ? TEE_ERROR_SHORT_BUFFER : TEE_ERROR_MAC_INVALID);
+    } catch (const std::exception&) {
+      refuse(TEE_ERROR_MAC_INVALID);
+    }
   });
 }
 

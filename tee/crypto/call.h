@@ -68,8 +68,7 @@ class output {
   std::uint32_t capacity_ = 0;
 };
 
-/// crypto_call is platform_call for a body that refuses by throwing. Only a short buffer leaves a length behind: every
-/// other failure has written nothing that counts.
+/// crypto_call is platform_call for a body that refuses by throwing.
 template <class Body>
 TEE_Result crypto_call(const char* name, std::uint32_t* length, Body&& body) noexcept {
   return platform_call(name, length, [&](instance& self) -> TEE_Result {
@@ -78,6 +77,7 @@ TEE_Result crypto_call(const char* name, std::uint32_t* length, Body&& body) noe
       std::forward<Body>(body)(self);
       return TEE_SUCCESS;
     } catch (const call_failure& refusal) {
+      // Caught here so that an ordered falsification sees refusals too.
       if (length != nullptr && refusal.code() != TEE_ERROR_SHORT_BUFFER) *length = 0;
       return refusal.code();
     }

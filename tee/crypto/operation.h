@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <optional>
 
 #include "tee/crypto/algorithm_table.h"
 #include "tee/crypto/transient_object.h"
@@ -115,10 +116,13 @@ TEE_Result operation_call(const char* name, TEE_OperationHandle handle, std::uin
 
 template <class Operation, class Body>
 void operation_step(const char* name, TEE_OperationHandle handle, Body&& body) noexcept {
-  platform_call_void(name, [&](instance& self) {
+  platform_step(name, [&](instance& self, const std::optional<TEE_Result>& fault) {
     const error_queue_scope own_errors;
     auto& found = find_operation<Operation>(self, handle);
-    found.guard([&] { body(found); });
+    found.guard([&] {
+      if (fault) refuse(*fault);
+      body(found);
+    });
   });
 }
 

@@ -129,10 +129,10 @@ typedef struct {
 
 /// TEEC_InitializeContext connects to a TEE. `name` chooses the way in: "embedded:FOLDER" runs the hosted TEE on that
 /// state folder inside the calling process; NULL takes the name in the environment variable KEYMASTER_TEE, or the
-/// default state folder. TEEC_ERROR_BAD_PARAMETERS for another form, TEEC_ERROR_ITEM_NOT_FOUND for a name with nothing
-/// behind it, TEEC_ERROR_BUSY when another process holds the folder, TEEC_ERROR_BAD_STATE when a newer version wrote
-/// it, TEEC_ERROR_SECURITY when its content does not authenticate, TEEC_ERROR_GENERIC when it can't be used for another
-/// reason.
+/// default state folder. TEEC_ERROR_BAD_PARAMETERS for another form, TEEC_ERROR_BUSY when another process holds the
+/// folder, TEEC_ERROR_BAD_STATE when a newer version wrote it, TEEC_ERROR_BAD_FORMAT when one of its text files
+/// (`settings`, for one) can't be parsed, TEEC_ERROR_SECURITY when its content does not authenticate,
+/// TEEC_ERROR_GENERIC when it can't be used for another reason. KEYMASTER_TRACE has the reason printed.
 TEEC_Result TEEC_InitializeContext(const char* name, TEEC_Context* context);
 void TEEC_FinalizeContext(TEEC_Context* context);
 

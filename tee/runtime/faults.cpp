@@ -1,5 +1,6 @@
 #include "tee/runtime/faults.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace hosted_tee {
@@ -21,6 +22,10 @@ void fault_plan::override_output(std::string_view name, std::uint32_t n,
   edits_.push_back({std::string(name), n, TEE_SUCCESS, std::move(edit)});
 }
 
+void fault_plan::observe_calls(std::function<void(std::uint32_t number, std::string_view name)> action) {
+  call_action_ = std::move(action);
+}
+
 void fault_plan::at_storage_step(std::function<void(std::string_view step)> action) {
   storage_action_ = std::move(action);
 }
@@ -35,10 +40,11 @@ std::uint32_t fault_plan::call_count(std::string_view name) const {
   return counts_.count(name);
 }
 
-std::optional<TEE_Result> fault_plan::ordered_failure(std::string_view name) {
+std::optional<TEE_Result> fault_plan::ordered_failure(std::string_view name, bool is_step) {
   std::optional<TEE_Result> result;
   std::erase_if(failures_, [&](order& o) {
-    if ((!o.name.empty() && o.name != name) || --o.calls != 0) return false;
+    const bool meant = o.name.empty() ? !is_step : o.name == name;
+    if (!meant || --o.calls != 0) return false;
     result = o.result;
     return true;
   });
@@ -46,11 +52,15 @@ std::optional<TEE_Result> fault_plan::ordered_failure(std::string_view name) {
   return result;
 }
 
-std::optional<TEE_Result> fault_plan::on_call(const char* name, bool fallible) {
+std::optional<TEE_Result> fault_plan::on_call(const char* name, call_kind kind) {
   counts_.add(name);
-  if (!fallible) return std::nullopt;
-  ++fallible_calls_;
-  return failures_.empty() ? std::nullopt : ordered_failure(name);
+  ++calls_;
+  if (call_action_) call_action_(calls_, name);
+  if (kind == call_kind::infallible) return std::nullopt;
+  const bool is_step = kind == call_kind::step;
+  if (is_step && std::find(steps_.begin(), steps_.end(), name) == steps_.end()) steps_.emplace_back(name);
+  if (!is_step) ++fallible_calls_;
+  return failures_.empty() ? std::nullopt : ordered_failure(name, is_step);
 }
 
 bool fault_plan::on_allocation() {

@@ -9,14 +9,20 @@
 
 namespace hosted_tee {
 
-[[nodiscard]] inline std::string to_hex(std::span<const std::uint8_t> bytes) {
+/// append_hex appends two lower-case digits a byte to `text`, a container of characters or bytes.
+template <class Text>
+void append_hex(Text& text, std::span<const std::uint8_t> bytes) {
   constexpr std::string_view digits = "0123456789abcdef";
-  std::string text;
-  text.reserve(bytes.size() * 2);
+  text.reserve(text.size() + bytes.size() * 2);
   for (const std::uint8_t byte : bytes) {
-    text.push_back(digits[byte >> 4]);
-    text.push_back(digits[byte & 15U]);
+    text.push_back(static_cast<typename Text::value_type>(digits[byte >> 4]));
+    text.push_back(static_cast<typename Text::value_type>(digits[byte & 15U]));
   }
+}
+
+[[nodiscard]] inline std::string to_hex(std::span<const std::uint8_t> bytes) {
+  std::string text;
+  append_hex(text, bytes);
   return text;
 }
 

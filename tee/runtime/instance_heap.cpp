@@ -58,9 +58,10 @@ void* instance_heap::reallocate(void* block, std::uint32_t new_size) {
   const heap_block* found = blocks_.find(block);
   if (found == nullptr) return nullptr;
   const heap_block old = *found;
-  void* moved = take(new_size, old.zero, bytes_ - charge(old.size) + charge(new_size));
+  void* moved = take(new_size, old.zero, bytes_ + charge(new_size));
   if (moved == nullptr) return nullptr;
   std::memcpy(moved, block, std::min(old.size, new_size));
+  bytes_ -= static_cast<std::uint32_t>(charge(old.size));
   release(old);
   return moved;
 }

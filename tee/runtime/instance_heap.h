@@ -14,7 +14,8 @@ namespace hosted_tee {
 /// Each block comes from the host's allocator (so that the address sanitizer watches it) and is charged its size
 /// rounded up to 8 bytes plus block_overhead. New bytes are zero for hint 0 and a fixed pattern otherwise; a block
 /// keeps its hint when it is reallocated. A zero-size block is a block. A pointer that the heap did not hand out is
-/// recognised. Reallocation always moves, so that the address sanitizer sees every use of the old block.
+/// recognised. Reallocation always moves, so that the address sanitizer sees every use of the old block; while it
+/// moves, both blocks are charged.
 class instance_heap {
  public:
   static constexpr std::uint32_t block_overhead = 16;

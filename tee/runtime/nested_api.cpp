@@ -12,10 +12,16 @@ session_service& other_tas(const instance& self) {
 
 TEE_Result open_session(instance& self, const TEE_UUID& destination, std::uint32_t types, TEE_Param* params,
                         TEE_TASessionHandle* handle, std::uint32_t& origin) {
-  auto session = std::make_unique<std::uint32_t>(0);
+  // The handle comes first: a session that is open already could not be given back for want of memory.
+  TEE_TASessionHandle made = self.sessions.insert(std::make_unique<std::uint32_t>(0));
   const TEE_Identity caller{TEE_LOGIN_TRUSTED_APP, self.uuid};
-  const TEE_Result result = other_tas(self).open_nested(destination, caller, types, params, *session, origin);
-  if (result == TEE_SUCCESS) *handle = self.sessions.insert(std::move(session));
+  const TEE_Result result =
+      other_tas(self).open_nested(destination, caller, types, params, *self.sessions.find(made), origin);
+  if (result == TEE_SUCCESS) {
+    *handle = made;
+  } else {
+    self.sessions.erase(made);
+  }
   return result;
 }
 

@@ -4,6 +4,7 @@
 
 #include <exception>
 #include <new>
+#include <optional>
 #include <string>
 #include <utility>
 
@@ -40,8 +41,9 @@ void report_panic(const instance& self, const char* function, const ta_panic& wh
 
 /// platform_call runs `body(instance&)` as the function `name`: ordered faults first, then the body, then ordered
 /// falsifications of its output. `length` is the call's output length, where it has one. No exception crosses: a
-/// call_failure is its code, want of host memory TEE_ERROR_OUT_OF_MEMORY, any other surprise TEE_ERROR_GENERIC; a
-/// panic does not return. `name` must be a literal: calls are counted by its address.
+/// call_failure is its code, want of host memory TEE_ERROR_OUT_OF_MEMORY, any other surprise TEE_ERROR_GENERIC, all
+/// with a length of 0 (only a short buffer tells one); a panic does not return. `name` must be a literal: calls are
+/// counted by its address.
 template <class Body>
 TEE_Result platform_call(const char* name, std::uint32_t* length, Body&& body) noexcept {
   bool panicked = false;
@@ -49,7 +51,7 @@ TEE_Result platform_call(const char* name, std::uint32_t* length, Body&& body) n
   {
     instance& self = current_instance();
     try {
-      if (const auto fault = self.faults.on_call(name, true)) {
+      if (const auto fault = self.faults.on_call(name, call_kind::fallible)) {
         if (length != nullptr) *length = 0;
         result = *fault;
       } else {
@@ -62,27 +64,30 @@ TEE_Result platform_call(const char* name, std::uint32_t* length, Body&& body) n
       report_panic(self, name, p);
     } catch (const call_failure& f) {
       result = f.code();
+      if (length != nullptr && result != TEE_ERROR_SHORT_BUFFER) *length = 0;
     } catch (const std::bad_alloc&) {
       result = TEE_ERROR_OUT_OF_MEMORY;
+      if (length != nullptr) *length = 0;
     } catch (const std::exception&) {
       result = TEE_ERROR_GENERIC;
+      if (length != nullptr) *length = 0;
     }
   }
   if (panicked) leave_by_panic(result, name);
   return result;
 }
 
-/// platform_call_void is platform_call for functions without a result: a failure other than a panic is the body's to
-/// remember (an operation becomes poisoned and its next call with a result reports it).
+/// call_without_result is platform_call for functions without a result; `body(instance&, fault)` gets the failure that
+/// was ordered, if there is one. Any exception that it lets out panics.
 template <class Body>
-void platform_call_void(const char* name, Body&& body) noexcept {
+void call_without_result(const char* name, call_kind kind, Body&& body) noexcept {
   bool panicked = false;
   TEE_Result code = TEE_SUCCESS;
   {
     instance& self = current_instance();
     try {
-      (void)self.faults.on_call(name, false);
-      std::forward<Body>(body)(self);
+      const std::optional<TEE_Result> fault = self.faults.on_call(name, kind);
+      std::forward<Body>(body)(self, fault);
     } catch (const ta_panic& p) {
       panicked = true;
       code = p.code;
@@ -93,6 +98,20 @@ void platform_call_void(const char* name, Body&& body) noexcept {
     }
   }
   if (panicked) leave_by_panic(code, name);
+}
+
+/// platform_call_void is for functions that cannot fail.
+template <class Body>
+void platform_call_void(const char* name, Body&& body) noexcept {
+  call_without_result(name, call_kind::infallible,
+                      [&](instance& self, const std::optional<TEE_Result>& /*fault*/) { body(self); });
+}
+
+/// platform_step is for functions that can fail without being able to say so: a failure is the body's to remember (an
+/// operation becomes poisoned and its next call with a result reports it).
+template <class Body>
+void platform_step(const char* name, Body&& body) noexcept {
+  call_without_result(name, call_kind::step, std::forward<Body>(body));
 }
 
 }  // namespace hosted_tee

@@ -24,10 +24,12 @@ constexpr std::array<std::pair<std::string_view, std::string_view>, 6> texts{{
     {"gpd.tee.firmware.implementation.version", "none"},
 }};
 
-constexpr std::array<std::pair<std::string_view, std::uint32_t>, 3> numbers{{
+constexpr std::array<std::pair<std::string_view, std::uint32_t>, 5> numbers{{
     {"gpd.tee.internalCore.version", 0x01010200},  // 1.1.2, a byte a part
     {"gpd.tee.systemTime.protectionLevel", protected_by_ree},
     {"gpd.tee.TAPersistentTime.protectionLevel", protected_by_ree},
+    {"gpd.tee.trustedStorage.antiRollback.protectionLevel", 0},  // of the private storage: none
+    {"gpd.tee.arith.maxBigIntSize", 0},                          // there is no arithmetical API
 }};
 
 constexpr std::array<std::pair<std::string_view, bool>, 1> booleans{{{"gpd.tee.cryptography.ecc", true}}};

@@ -4,6 +4,7 @@
 #include <condition_variable>
 #include <map>
 #include <mutex>
+#include <utility>
 
 #include "tee/runtime/world.h"
 
@@ -34,15 +35,36 @@ class running_devices {
       }
       changed_.wait(lock);
     }
-    const std::shared_ptr<world> started(new world(options), [folder](const world* ended) {
-      delete ended;
-      instance().forget(folder);
-    });
-    devices_[folder] = started;
+    // Whatever can be refused for want of memory comes first: once the device runs, its end takes the mutex.
+    const auto owner = std::make_shared<device_owner>(folder);
+    std::weak_ptr<world>& entry = devices_[folder];
+    try {
+      owner->running = std::make_unique<world>(options);
+    } catch (...) {
+      devices_.erase(folder);
+      throw;
+    }
+    const std::shared_ptr<world> started(owner, owner->running.get());
+    entry = started;
     return started;
   }
 
  private:
+  // Ends its device first, and the device's entry then.
+  struct device_owner {
+    explicit device_owner(std::string name) : folder(std::move(name)) {}
+    ~device_owner() {
+      if (running == nullptr) return;
+      running.reset();
+      instance().forget(folder);
+    }
+    device_owner(const device_owner&) = delete;
+    device_owner& operator=(const device_owner&) = delete;
+
+    std::string folder;
+    std::unique_ptr<world> running;
+  };
+
   void forget(const std::string& folder) {
     {
       const std::scoped_lock lock(mutex_);

@@ -27,10 +27,11 @@ namespace hosted_tee {
 
 /// Why a state folder cannot be used.
 enum class world_fault {
-  busy,     ///< another process holds the folder
-  newer,    ///< a newer version of the hosted TEE wrote it
-  corrupt,  ///< its content does not authenticate or parse
-  io,       ///< the system refused (permissions, space, …)
+  busy,       ///< another process holds the folder
+  newer,      ///< a newer version of the hosted TEE wrote it
+  malformed,  ///< one of its text files can't be parsed: a mistake in `settings`, or another one altered
+  corrupt,    ///< its content does not authenticate, or belongs to another device
+  io,         ///< the system refused (permissions, space, …)
 };
 
 class world_error : public std::runtime_error {

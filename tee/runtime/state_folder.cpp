@@ -1,10 +1,8 @@
 #include "tee/runtime/state_folder.h"
 
 #include <fcntl.h>
-#include <openssl/crypto.h>
 #include <openssl/rand.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 
 #include <cerrno>
 #include <charconv>
@@ -27,12 +25,8 @@ using preparation = std::function<void(const device_record&)>;
   throw world_error(world_fault::corrupt, file.string() + ": " + why);
 }
 
-// Never open to others, not even for a moment: the storage key will lie in it.
-void make_folder(const std::filesystem::path& folder) {
-  if (folder.has_parent_path()) std::filesystem::create_directories(folder.parent_path());
-  if (::mkdir(folder.c_str(), S_IRWXU) != 0 && errno != EEXIST) {
-    throw std::system_error(errno, std::generic_category(), folder.string());
-  }
+[[noreturn]] void malformed(const std::filesystem::path& file, const std::string& why) {
+  throw world_error(world_fault::malformed, file.string() + ": " + why);
 }
 
 file_descriptor take_lock(const std::filesystem::path& folder) {
@@ -65,72 +59,83 @@ void check_version(const std::filesystem::path& folder, const step_observer& ste
   const std::string_view text = trimmed(*content);
   unsigned version = 0;
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), version);
-  if (error != std::errc() || end != text.data() + text.size() || version == 0) corrupt(file, "not a version number");
+  if (error != std::errc() || end != text.data() + text.size() || version == 0) malformed(file, "not a version number");
   if (version > layout_version) {
     throw world_error(world_fault::newer, folder.string() + " was written by a newer version");
   }
 }
 
+// Whether a message may repeat what a file says.
+enum class content { open, secret };
+
 // Calls `take(name, value)` for each `name = value` line; `take` answers whether it knows the two.
 template <class Take>
-void read_lines(const std::filesystem::path& file, std::string_view content, Take&& take) {
-  while (!content.empty()) {
-    const std::size_t end = content.find('\n');
-    const std::string_view line = trimmed(content.substr(0, end));
-    content.remove_prefix(end == std::string_view::npos ? content.size() : end + 1);
+void read_lines(const std::filesystem::path& file, std::string_view text, content kind, Take&& take) {
+  for (unsigned number = 1; !text.empty(); ++number) {
+    const std::size_t end = text.find('\n');
+    const std::string_view line = trimmed(text.substr(0, end));
+    text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
     if (line.empty() || line.front() == '#') continue;
     const std::size_t equals = line.find('=');
     const bool known =
         equals != std::string_view::npos && take(trimmed(line.substr(0, equals)), trimmed(line.substr(equals + 1)));
-    if (!known) corrupt(file, "can't make sense of the line: " + std::string(line));
+    if (known) continue;
+    const std::string where = "can't make sense of line " + std::to_string(number);
+    malformed(file, kind == content::secret ? where : where + ": " + std::string(line));
   }
 }
 
-void wipe(std::string& text) {
-  OPENSSL_cleanse(text.data(), text.size());
+std::string_view as_text(const secret_bytes& bytes) {
+  return {reinterpret_cast<const char*>(bytes.data()), bytes.size()};
+}
+
+void append(secret_bytes& text, std::string_view part) {
+  text.insert(text.end(), part.begin(), part.end());
 }
 
 device_record make_device(const std::filesystem::path& file, const step_observer& step, const preparation& prepare) {
   device_record device{random_uuid(), {}};
-  if (RAND_bytes(device.key.data(), static_cast<int>(device.key.size())) != 1) {
+  if (RAND_bytes(device.key.bytes().data(), static_cast<int>(device.key.bytes().size())) != 1) {
     throw world_error(world_fault::io, "libcrypto has no random bytes");
   }
   prepare(device);
-  std::string text = "device-id = " + to_text(device.id) + "\nstorage-key = " + to_hex(device.key) + "\n";
-  write_durably(file, text, step);
-  wipe(text);
+  secret_bytes text;
+  append(text, "device-id = " + to_text(device.id) + "\nstorage-key = ");
+  append_hex(text, device.key.bytes());
+  append(text, "\n");
+  write_durably(file, as_text(text), step);
   return device;
 }
 
 device_record load_device(const std::filesystem::path& folder, const step_observer& step, const preparation& prepare) {
   const std::filesystem::path file = folder / "device";
-  std::optional<std::string> content = read_file(file);
-  if (!content) return make_device(file, step, prepare);
+  const std::optional<secret_bytes> text = read_secret(file);
+  if (!text) return make_device(file, step, prepare);
   std::optional<TEE_UUID> id;
   std::optional<storage_key> key;
-  read_lines(file, *content, [&](std::string_view name, std::string_view value) {
+  read_lines(file, as_text(*text), content::secret, [&](std::string_view name, std::string_view value) {
     if (name == "device-id") return (id = parse_uuid(value)).has_value();
-    return name == "storage-key" && from_hex(value, key.emplace());
+    return name == "storage-key" && from_hex(value, key.emplace().bytes());
   });
-  wipe(*content);
-  if (!id || !key) corrupt(file, "the identity or the storage key is missing");
+  if (!id || !key) malformed(file, "the identity or the storage key is missing");
   return {*id, *key};
 }
 
+// Of two lines for one thing neither is what the person meant for sure: the second is refused.
 bool take_setting(device_settings& settings, std::string_view name, std::string_view value) {
   if (name == "rpmb") {
+    if (settings.rpmb) return false;
     settings.rpmb = value == "on";
     return value == "on" || value == "off";
   }
-  if (name == "device-id") return (settings.device_id = parse_uuid(value)).has_value();
-  settings.text_properties.emplace(name, value);
-  return is_settable_property(name);
+  if (name == "device-id") return !settings.device_id && (settings.device_id = parse_uuid(value)).has_value();
+  return is_settable_property(name) && settings.text_properties.emplace(name, value).second;
 }
 
 device_settings load_settings(const std::filesystem::path& folder) {
   const std::filesystem::path file = folder / "settings";
   device_settings settings;
-  read_lines(file, read_file(file).value_or(""),
+  read_lines(file, read_file(file).value_or(""), content::open,
              [&](std::string_view name, std::string_view value) { return take_setting(settings, name, value); });
   return settings;
 }

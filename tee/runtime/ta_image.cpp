@@ -50,13 +50,8 @@ file_descriptor copy_to_memory(const std::filesystem::path& file) {
   const std::optional<std::string> content = read_file(file);
   if (!content) throw std::runtime_error("the file is gone");
   file_descriptor memory(memfd_create(file.filename().c_str(), MFD_CLOEXEC));
-  std::string_view rest = *content;
-  while (memory.is_open() && !rest.empty()) {
-    const ssize_t written = ::write(memory.get(), rest.data(), rest.size());
-    if (written < 0) throw std::system_error(errno, std::generic_category(), "copying the image");
-    rest.remove_prefix(static_cast<std::size_t>(written));
-  }
   if (!memory.is_open()) throw std::system_error(errno, std::generic_category(), "memfd_create");
+  write_all(memory.get(), *content, "the copy of the image");
   return memory;
 }
 

@@ -1,6 +1,5 @@
 #include "tee/runtime/uuid.h"
 
-#include <openssl/evp.h>
 #include <openssl/rand.h>
 
 #include <algorithm>
@@ -8,6 +7,7 @@
 #include <stdexcept>
 #include <vector>
 
+#include "tee/crypto/algorithms.h"
 #include "tee/runtime/hex.h"
 
 namespace hosted_tee {
@@ -80,7 +80,7 @@ TEE_UUID named_uuid(std::string_view name) {
   std::vector<std::uint8_t> input(client_name_space.begin(), client_name_space.end());
   input.insert(input.end(), name.begin(), name.end());
   std::array<std::uint8_t, EVP_MAX_MD_SIZE> digest{};
-  if (EVP_Digest(input.data(), input.size(), digest.data(), nullptr, EVP_sha1(), nullptr) != 1) {
+  if (EVP_Digest(input.data(), input.size(), digest.data(), nullptr, fetched_digest(digest_kind::sha1), nullptr) != 1) {
     throw std::runtime_error("SHA-1 is not available");
   }
   uuid_bytes bytes{};

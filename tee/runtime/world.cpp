@@ -16,12 +16,10 @@ std::vector<std::filesystem::path> folders_of(const world_options& options) {
   return {options.ta_folder};
 }
 
-std::array<std::uint8_t, 32> draw_boot_seed() {
-  std::array<std::uint8_t, 32> seed{};
+void draw_boot_seed(std::array<std::uint8_t, 32>& seed) {
   if (RAND_bytes(seed.data(), static_cast<int>(seed.size())) != 1) {
     throw world_error(world_fault::io, "libcrypto has no random bytes");
   }
-  return seed;
 }
 
 store_options private_options(const step_observer& step) {
@@ -59,7 +57,11 @@ world::world(const world_options& options)
   const device_settings& settings = folder_.settings();
   device_.faults.at_storage_step(options.at_storage_step);
   device_.id = options.device_id.value_or(settings.device_id.value_or(folder_.device().id));
-  device_.boot_seed = options.boot_seed ? *options.boot_seed : draw_boot_seed();
+  if (options.boot_seed) {
+    device_.boot_seed = *options.boot_seed;
+  } else {
+    draw_boot_seed(device_.boot_seed);
+  }
   device_.text_properties = settings.text_properties;
   device_.other_tas = this;
   device_.ta_folders = folders_of(options);
@@ -74,7 +76,11 @@ world::~world() = default;
 
 bool world::has_rpmb() const {
   const std::scoped_lock lock(mutex_);
-  return device_.rpmb_store != nullptr && device_.rpmb_store->check() == TEE_SUCCESS;
+  try {
+    return device_.rpmb_store != nullptr && device_.rpmb_store->check() == TEE_SUCCESS;
+  } catch (const call_failure&) {
+    return false;  // what cannot be read has not passed its check
+  }
 }
 
 accounting world::account(const TEE_UUID& ta) const {

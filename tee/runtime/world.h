@@ -57,6 +57,7 @@ class world final : public secure_world, private session_service {
                            std::uint32_t& origin) override;
   void close_nested(std::uint32_t session) override;
 
+  [[nodiscard]] std::uint32_t free_session_number();
   [[nodiscard]] TEE_Result target_for(const TEE_UUID& ta, ta_instance*& target);
   [[nodiscard]] TEE_Result start_instance(const TEE_UUID& ta, ta_instance*& target);
   [[nodiscard]] TEE_Result enter(ta_instance& ta, call& what, std::uint32_t& origin);

@@ -161,15 +161,24 @@ TEE_Result world::open_nested(const TEE_UUID& ta, const TEE_Identity& client, st
   origin = TEE_ORIGIN_TEE;
   ta_instance* target = nullptr;
   if (const TEE_Result result = target_for(ta, target); result != TEE_SUCCESS) return result;
-  session_record record{target, nullptr, client};
+  // The session has its place before the TA accepts it: afterwards nothing may fail that would leave it open for ever.
+  const std::uint32_t number = free_session_number();
+  session_record& record = sessions_.emplace(number, session_record{target, nullptr, client}).first->second;
   call what{call::entry::open, &record, 0, param_types, params};
   const TEE_Result result = enter(*target, what, origin);
-  if (result != TEE_SUCCESS) return result;
-  while (++last_session_ == 0 || sessions_.contains(last_session_)) {
+  if (result == TEE_SUCCESS) {
+    session = number;
+  } else {
+    sessions_.erase(number);
   }
-  sessions_.emplace(last_session_, record);
-  session = last_session_;
   return result;
+}
+
+std::uint32_t world::free_session_number() {
+  do {
+    ++last_session_;
+  } while (last_session_ == 0 || sessions_.contains(last_session_));
+  return last_session_;
 }
 
 TEE_Result world::invoke_nested(std::uint32_t session, std::uint32_t command, std::uint32_t param_types,
@@ -183,7 +192,7 @@ TEE_Result world::invoke_nested(std::uint32_t session, std::uint32_t command, st
   ta_instance* ta = found->second.ta;
   if (ta == nullptr) return TEE_ERROR_TARGET_DEAD;
   if (ta->busy) return TEE_ERROR_BUSY;
-  session_record record = found->second;  // a nested call may move the table's records
+  session_record record = found->second;  // a nested call may close this session
   call what{call::entry::invoke, &record, command, param_types, params};
   return enter(*ta, what, origin);
 }

@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <array>
 
-#include "tee/crypto/libcrypto.h"
+#include "tee/crypto/algorithms.h"
 
 namespace hosted_tee {
 namespace {
@@ -27,7 +27,8 @@ statement keyed(database& db, const char* sql, const object_key& key) {
 class digester {
  public:
   digester() : context_(owned<evp_digest_context>(EVP_MD_CTX_new())) {
-    if (EVP_DigestInit_ex(context_.get(), EVP_sha256(), nullptr) != 1) throw call_failure(TEE_ERROR_GENERIC);
+    const EVP_MD* const sha256 = fetched_digest(digest_kind::sha256);
+    if (EVP_DigestInit_ex2(context_.get(), sha256, nullptr) != 1) throw call_failure(TEE_ERROR_GENERIC);
   }
 
   // Each part goes in behind its length, so that no two contents digest the same bytes.

@@ -5,7 +5,7 @@
 
 #include <limits>
 
-#include "tee/crypto/libcrypto.h"
+#include "tee/crypto/algorithms.h"
 #include "tee/runtime/platform_call.h"
 
 namespace hosted_tee {
@@ -27,7 +27,9 @@ int length_of(std::size_t size) {
 evp_cipher_context start(const storage_key& key, std::span<const std::uint8_t> nonce, std::string_view label,
                          bool encrypt) {
   auto context = owned<evp_cipher_context>(EVP_CIPHER_CTX_new());
-  require(EVP_CipherInit_ex(context.get(), EVP_aes_256_gcm(), nullptr, key.data(), nonce.data(), encrypt ? 1 : 0));
+  const std::span<const std::uint8_t> key_bytes = key.bytes();
+  require(EVP_CipherInit_ex2(context.get(), fetched_aes(block_mode::gcm, key_bytes.size()), key_bytes.data(),
+                             nonce.data(), encrypt ? 1 : 0, nullptr));
   int length = 0;
   const auto* aad = reinterpret_cast<const std::uint8_t*>(label.data());
   require(EVP_CipherUpdate(context.get(), nullptr, &length, aad, length_of(label.size())));
@@ -41,10 +43,6 @@ void run(EVP_CIPHER_CTX* context, std::span<const std::uint8_t> in, std::uint8_t
 }
 
 }  // namespace
-
-sealer::~sealer() {
-  OPENSSL_cleanse(key_.data(), key_.size());
-}
 
 std::vector<std::uint8_t> sealer::seal(std::string_view label, std::span<const std::uint8_t> data) const {
   const error_queue_scope errors;

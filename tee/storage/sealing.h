@@ -13,7 +13,20 @@
 
 namespace hosted_tee {
 
-using storage_key = std::array<std::uint8_t, 32>;
+/// The device storage key. Every copy wipes itself when it goes.
+class storage_key {
+ public:
+  storage_key() = default;
+  storage_key(const storage_key&) = default;
+  storage_key& operator=(const storage_key&) = default;
+  ~storage_key() { OPENSSL_cleanse(bytes_.data(), bytes_.size()); }
+
+  [[nodiscard]] std::span<std::uint8_t, 32> bytes() { return bytes_; }
+  [[nodiscard]] std::span<const std::uint8_t, 32> bytes() const { return bytes_; }
+
+ private:
+  std::array<std::uint8_t, 32> bytes_{};
+};
 
 /// A sealed record is a random 12-byte nonce, the ciphertext and a 16-byte tag. The label names the place that the
 /// record belongs to, so that it does not open anywhere else.
@@ -22,9 +35,6 @@ class sealer {
   static constexpr std::uint32_t overhead = 12 + 16;
 
   explicit sealer(const storage_key& key) : key_(key) {}
-  ~sealer();
-  sealer(const sealer&) = default;
-  sealer& operator=(const sealer&) = delete;
 
   /// seal throws call_failure when libcrypto refuses.
   [[nodiscard]] std::vector<std::uint8_t> seal(std::string_view label, std::span<const std::uint8_t> data) const;

@@ -46,6 +46,44 @@ TEST_F(AuthorizeBeginRsaTest, AnotherPaddingOrDigestIsRefused) {
   EXPECT_THAT(ta.errors(), ElementsAre("No such digest in key_params"));
 }
 
+// Where the padding is for encryption, the digest is a part of it, and the key's digests don't restrict it.
+TEST_F(AuthorizeBeginRsaTest, ADigestCountsWithThePaddingsOfSignaturesOnly) {
+  const param_list key = narrow_key()
+                             .remove(KM_TAG_PADDING)
+                             .add(KM_TAG_PADDING, KM_PAD_RSA_OAEP)
+                             .add(KM_TAG_PADDING, KM_PAD_RSA_PKCS1_1_5_ENCRYPT);
+  for (const std::uint32_t padding : {KM_PAD_RSA_OAEP, KM_PAD_RSA_PKCS1_1_5_ENCRYPT}) {
+    EXPECT_EQ(begin(key, KM_PURPOSE_SIGN, signature(KM_DIGEST_SHA1, padding)), KM_ERROR_OK) << padding;
+  }
+  for (const std::uint32_t padding : {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN}) {
+    const param_list allowed = narrow_key().remove(KM_TAG_PADDING).add(KM_TAG_PADDING, padding);
+    EXPECT_EQ(begin(allowed, KM_PURPOSE_SIGN, signature(KM_DIGEST_SHA_2_256, padding)), KM_ERROR_OK) << padding;
+    EXPECT_EQ(begin(allowed, KM_PURPOSE_SIGN, signature(KM_DIGEST_SHA1, padding)), KM_ERROR_INCOMPATIBLE_DIGEST)
+        << padding;
+  }
+}
+
+TEST_F(AuthorizeBeginRsaTest, APaddingThatIsRepeatedIsNoneAndTakesTheDigestWithIt) {
+  for (const std::uint32_t second : {KM_PAD_RSA_PKCS1_1_5_SIGN, KM_PAD_RSA_PSS}) {
+    const param_list request = signature(KM_DIGEST_SHA1, KM_PAD_RSA_PKCS1_1_5_SIGN).add(KM_TAG_PADDING, second);
+    EXPECT_EQ(begin(narrow_key(), KM_PURPOSE_SIGN, request), KM_ERROR_OK);
+  }
+  EXPECT_THAT(ta.errors(), IsEmpty());
+}
+
+TEST_F(AuthorizeBeginRsaTest, WithoutAPaddingTheDigestDoesNotCount) {
+  EXPECT_EQ(begin(narrow_key(), KM_PURPOSE_SIGN, param_list{}.add(KM_TAG_DIGEST, KM_DIGEST_SHA1)), KM_ERROR_OK);
+  EXPECT_EQ(begin(narrow_key(), KM_PURPOSE_SIGN, {}), KM_ERROR_OK);
+}
+
+TEST_F(AuthorizeBeginRsaTest, ADigestThatIsRepeatedIsNone) {
+  for (const std::uint32_t second : {KM_DIGEST_SHA1, KM_DIGEST_SHA_2_512}) {
+    EXPECT_EQ(
+        begin(narrow_key(), KM_PURPOSE_SIGN, signature(KM_DIGEST_SHA1, KM_PAD_RSA_PSS).add(KM_TAG_DIGEST, second)),
+        KM_ERROR_OK);
+  }
+}
+
 TEST_F(AuthorizeBeginRsaTest, RsaHasNoBlockModes) {
   EXPECT_EQ(begin(narrow_key(), KM_PURPOSE_SIGN,
                   signature(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PSS).add(KM_TAG_BLOCK_MODE, KM_MODE_GCM)),

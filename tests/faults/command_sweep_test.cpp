@@ -2,6 +2,9 @@
 // itself, leave nothing behind, spoil nothing of other operations, and work again the next time.
 #include <fmt/format.h>
 
+#include <map>
+#include <set>
+
 #include "tests/faults/stage.h"
 
 using namespace keymaster;
@@ -40,6 +43,7 @@ class CommandSweepTest : public ::testing::TestWithParam<scenario> {
   hosted_tee::fault_plan& faults = on.tee.world().faults();
   hosted_tee::accounting baseline;
   std::uint32_t counted_allocations = 0, counted_calls = 0;
+  std::map<std::string, std::uint32_t> counted_steps;  // calls by name
 
   void expect_baseline() {
     const hosted_tee::accounting now = on.tee.accounting();
@@ -68,6 +72,8 @@ class CommandSweepTest : public ::testing::TestWithParam<scenario> {
     const answer got = play.run(on);
     counted_allocations = faults.allocations();
     counted_calls = faults.fallible_calls();
+    counted_steps.clear();
+    for (const std::string& step : faults.steps()) counted_steps[step] = faults.call_count(step);
     EXPECT_EQ(got.result, play.result);
     EXPECT_EQ(got.error, play.error);
     if (!got.ok()) expect_failed(got);
@@ -127,6 +133,58 @@ TEST_P(CommandSweepTest, FailsCleanlyWhateverFailsBelow) {
   expect_whole_pool();
 }
 
+/// A step that fails cannot say so. The next call with a result does, in the same command or in the finish of the
+/// operation that was spoilt; want of random data ends the instance.
+class StepSweepTest : public CommandSweepTest {
+ protected:
+  /// run_spoilt plays with the n-th call of `step` failing.
+  answer run_spoilt(const std::string& step, std::uint32_t n) {
+    if (play.approach) play.approach(on);
+    faults.clear();
+    faults.fail_call(step, n, TEE_ERROR_OUT_OF_MEMORY);
+    const answer got = play.run(on);
+    EXPECT_TRUE(faults.triggered());
+    faults.clear();
+    return got;
+  }
+
+  void expect_spoilt(const answer& got) {
+    if (!got.ok()) return expect_failed(got);
+    const finish_answer finished = on.client().finish(on.handle, on.signature, on.with_token());
+    EXPECT_EQ(finished.result, TEEC_ERROR_GENERIC);
+    expect_failed(finished);
+  }
+};
+
+TEST_P(StepSweepTest, IsNeverDoneWithASpoiltOperation) {
+  play.arrange(on);
+  bystander other(on);
+  baseline = on.tee.accounting();
+  run_clean();
+  run_clean();
+  std::map<std::string, std::uint32_t> calls = counted_steps;
+  const std::uint32_t draws = calls["TEE_GenerateRandom"];
+  calls.erase("TEE_GenerateRandom");
+  for (const auto& [step, count] : calls) {
+    for (std::uint32_t n = 1; n <= count && !HasFailure(); ++n) {
+      SCOPED_TRACE(fmt::format("{} number {} fails", step, n));
+      expect_spoilt(run_spoilt(step, n));
+      expect_baseline();
+      run_clean();
+      other.feed();
+    }
+  }
+  if (draws == 0) return other.finish();
+  // Comes last: with the instance go its operations.
+  SCOPED_TRACE("there is no random data");
+  const answer got = run_spoilt("TEE_GenerateRandom", draws);
+  EXPECT_EQ(got.result, TEEC_ERROR_TARGET_DEAD);
+  EXPECT_FALSE(on.tee.world().has_instance(keymaster_ta));
+  on.tee.open_session();
+  on.fillers.clear();
+  expect_whole_pool();
+}
+
 std::vector<scenario> all_scenarios() {
   std::vector<scenario> all;
   for (const auto& some : {key_scenarios(), begin_scenarios(), step_scenarios(), finish_scenarios()}) {
@@ -134,6 +192,16 @@ std::vector<scenario> all_scenarios() {
   }
   return all;
 }
+
+TEST(Scenarios, AreAtLeastFortyWithNamesOfTheirOwn) {
+  std::set<std::string> names;
+  for (const scenario& play : all_scenarios()) names.emplace(play.name);
+  EXPECT_EQ(names.size(), all_scenarios().size());
+  EXPECT_GE(names.size(), 40U);
+}
+
+INSTANTIATE_TEST_SUITE_P(Every, StepSweepTest, ::testing::ValuesIn(all_scenarios()),
+                         [](const auto& played) { return std::string(played.param.name); });
 
 INSTANTIATE_TEST_SUITE_P(Every, CommandSweepTest, ::testing::ValuesIn(all_scenarios()),
                          [](const auto& played) { return std::string(played.param.name); });

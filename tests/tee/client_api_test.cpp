@@ -1,7 +1,10 @@
 // The Client API against a scripted TA: contexts, parameters of every type, shared memory, logins, origins.
 #include <gmock/gmock.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <array>
+#include <csignal>
 #include <fstream>
 
 #include "tee/client/connection.h"
@@ -337,10 +340,47 @@ TEST_F(ContextTest, EachFaultOfAFolderHasItsResult) {
   std::ofstream(folder.path() / "state" / "version") << "999";
   EXPECT_EQ(initialize(name.c_str()), TEEC_ERROR_BAD_STATE);
   std::ofstream(folder.path() / "state" / "version") << "?";
+  EXPECT_EQ(initialize(name.c_str()), TEEC_ERROR_BAD_FORMAT);
+  fs::remove(folder.path() / "state" / "version");
   EXPECT_EQ(initialize(name.c_str()), TEEC_ERROR_SECURITY);
   std::ofstream(path("file")) << "in the way";
   EXPECT_EQ(initialize(("embedded:" + path("file")).c_str()), TEEC_ERROR_GENERIC);
-  EXPECT_EQ(result_of(world_fault::busy), TEEC_ERROR_BUSY);
+}
+
+TEST_F(ContextTest, TheReasonIsPrintedWhereTheTraceIs) {
+  fs::create_directory(path("state"));
+  std::ofstream(folder.path() / "state" / "settings") << "rpbm = off\n";
+  const auto printed = [&](const char* level) {
+    const variable trace("KEYMASTER_TRACE", level);
+    ::testing::internal::CaptureStderr();
+    EXPECT_EQ(initialize(("embedded:" + path("state")).c_str()), TEEC_ERROR_BAD_FORMAT);
+    return ::testing::internal::GetCapturedStderr();
+  };
+  EXPECT_EQ(printed("error"),
+            "TEE error client_api:0: " + path("state") + "/settings: can't make sense of line 1: rpbm = off\n");
+  EXPECT_EQ(printed(nullptr), "");
+}
+
+TEST_F(ContextTest, AFolderIsBusyAsLongAsTheProcessThatHoldsItLives) {
+  const std::string name = "embedded:" + path("state");
+  std::array<int, 2> ready{};
+  ASSERT_EQ(::pipe(ready.data()), 0);
+  const pid_t holder = ::fork();
+  if (holder == 0) {
+    TEEC_Context context{};
+    const TEEC_Result result = TEEC_InitializeContext(name.c_str(), &context);
+    (void)!::write(ready[1], &result, sizeof result);
+    for (;;) ::pause();
+  }
+  TEEC_Result of_holder = TEEC_ERROR_GENERIC;
+  EXPECT_EQ(::read(ready[0], &of_holder, sizeof of_holder), static_cast<ssize_t>(sizeof of_holder));
+  EXPECT_EQ(of_holder, TEEC_SUCCESS);
+  EXPECT_EQ(initialize(name.c_str()), TEEC_ERROR_BUSY);
+  EXPECT_EQ(::kill(holder, SIGKILL), 0);
+  EXPECT_EQ(::waitpid(holder, nullptr, 0), holder);
+  EXPECT_EQ(initialize(name.c_str()), TEEC_SUCCESS);
+  ::close(ready[0]);
+  ::close(ready[1]);
 }
 
 }  // namespace

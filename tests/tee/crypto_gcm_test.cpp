@@ -186,6 +186,48 @@ TEST_F(GcmTest, NothingButInvalidComesFromASpoiledDecryption) {
   EXPECT_EQ(final_tag(encrypt_).result, TEE_ERROR_GENERIC);
 }
 
+TEST_F(GcmTest, OrderedFailureOfAssociatedDataSpoilsTheMessage) {
+  faults().fail_call("TEE_AEUpdateAAD", 1, TEE_ERROR_BUSY);
+  ASSERT_EQ(init(decrypt_, 128), TEE_SUCCESS);
+  add_aad(decrypt_, from_hex(aad_hex));
+  EXPECT_TRUE(faults().triggered());
+  EXPECT_EQ(update(decrypt_, from_hex(cipher_hex), 60).result, TEE_ERROR_GENERIC);
+  EXPECT_EQ(check_tag(decrypt_, from_hex(tag_hex)), TEE_ERROR_MAC_INVALID);
+}
+
+TEST_F(GcmTest, FailedEncryptionTellsNeitherLength) {
+  const bytes plain = from_hex(plain_hex);
+  const auto finish = [&](const void* source, std::uint32_t& length, std::uint32_t& tag_length) {
+    bytes sealed(60), tag(16);
+    length = 60;
+    tag_length = 16;
+    return TEE_AEEncryptFinal(encrypt_.get(), source, 60, sealed.data(), &length, tag.data(), &tag_length);
+  };
+  std::uint32_t length = 0, tag_length = 0;
+  ASSERT_EQ(init(encrypt_, 128), TEE_SUCCESS);
+  EXPECT_EQ(finish(nullptr, length, tag_length), TEE_ERROR_BAD_PARAMETERS);
+  EXPECT_EQ(length, 0U);
+  EXPECT_EQ(tag_length, 0U);
+  faults().fail_call("TEE_AEEncryptFinal", 1, TEE_ERROR_BUSY);
+  EXPECT_EQ(finish(plain.data(), length, tag_length), TEE_ERROR_BUSY);
+  EXPECT_EQ(length, 0U);
+  EXPECT_EQ(tag_length, 0U);
+}
+
+TEST_F(GcmTest, TagOfAnotherLengthIsInvalidWhateverElseIsWrong) {
+  ASSERT_EQ(init(decrypt_, 128), TEE_SUCCESS);
+  bytes source = from_hex(cipher_hex), tag = from_hex(tag_hex), place(59);
+  std::uint32_t length = 59;
+  EXPECT_EQ(TEE_AEDecryptFinal(decrypt_.get(), source.data(), 60, place.data(), &length, tag.data(), 15),
+            TEE_ERROR_MAC_INVALID);
+  EXPECT_EQ(length, 0U);
+  ASSERT_EQ(init(decrypt_, 128), TEE_SUCCESS);
+  length = 59;
+  EXPECT_EQ(TEE_AEDecryptFinal(decrypt_.get(), source.data(), 60, place.data(), &length, tag.data(), 16),
+            TEE_ERROR_SHORT_BUFFER);
+  EXPECT_EQ(length, 60U);
+}
+
 TEST_F(GcmTest, ShortBufferTellsTheSizeAndChangesNothing) {
   ASSERT_EQ(init(encrypt_, 128), TEE_SUCCESS);
   add_aad(encrypt_, from_hex(aad_hex));

@@ -87,7 +87,7 @@ TEST_F(OperationTest, InformationFollowsTheKeyAndTheState) {
   const operation_owner mac = keyless(TEE_ALG_HMAC_SHA256, TEE_MODE_MAC, 512);
   TEE_OperationInfo info = info_of(mac);
   EXPECT_EQ(info.algorithm, TEE_ALG_HMAC_SHA256);
-  EXPECT_EQ(info.operationClass, 3U);
+  EXPECT_EQ(info.operationClass, TEE_OPERATION_MAC);
   EXPECT_EQ(info.mode, TEE_MODE_MAC);
   EXPECT_EQ(info.digestLength, 32U);
   EXPECT_EQ(info.maxKeySize, 512U);
@@ -107,11 +107,24 @@ TEST_F(OperationTest, InformationFollowsTheKeyAndTheState) {
   EXPECT_EQ(info_of(mac).handleState, 0U);
 
   info = info_of(keyless(TEE_ALG_SHA512, TEE_MODE_DIGEST, 0));
+  EXPECT_EQ(info.operationClass, TEE_OPERATION_DIGEST);
   EXPECT_EQ(info.digestLength, 64U);
   EXPECT_EQ(info.handleState, TEE_HANDLE_FLAG_KEY_SET | TEE_HANDLE_FLAG_INITIALIZED) << "a digest is always ready";
   EXPECT_EQ(info_of(keyless(TEE_ALG_RSA_NOPAD, TEE_MODE_DECRYPT, 512)).requiredKeyUsage,
             TEE_USAGE_DECRYPT | TEE_USAGE_SIGN);
   EXPECT_EQ(info_of(keyless(TEE_ALG_RSA_NOPAD, TEE_MODE_EXPORT, 512)).requiredKeyUsage, 0U);
+}
+
+TEST_F(OperationTest, ClassesHaveTheStandardsNumbers) {
+  const auto class_of = [](std::uint32_t algorithm, std::uint32_t mode, std::uint32_t bits) {
+    return info_of(keyless(algorithm, mode, bits)).operationClass;
+  };
+  EXPECT_EQ(class_of(TEE_ALG_AES_CTR, TEE_MODE_ENCRYPT, 128), 1U);
+  EXPECT_EQ(class_of(TEE_ALG_HMAC_SHA1, TEE_MODE_MAC, 160), 3U);
+  EXPECT_EQ(class_of(TEE_ALG_AES_GCM, TEE_MODE_ENCRYPT, 128), 4U);
+  EXPECT_EQ(class_of(TEE_ALG_SHA1, TEE_MODE_DIGEST, 0), 5U);
+  EXPECT_EQ(class_of(TEE_ALG_RSA_NOPAD, TEE_MODE_ENCRYPT, 512), 6U);
+  EXPECT_EQ(class_of(TEE_ALG_ECDSA_P256, TEE_MODE_SIGN, 256), 7U);
 }
 
 TEST_F(OperationTest, KeyAboveTheMaximumIsRefusedAndTheOldOneStays) {
@@ -167,6 +180,15 @@ TEST_F(OperationTest, RandomDataFillTheBufferAndNoMore) {
   EXPECT_NE(first, buffer);
   EXPECT_FALSE(panics([] { TEE_GenerateRandom(nullptr, 0); }));
   EXPECT_TRUE(panics([] { TEE_GenerateRandom(nullptr, 1); }));
+}
+
+TEST_F(OperationTest, WantOfRandomDataPanicsWithTheOrderedCode) {
+  faults().fail_call("TEE_GenerateRandom", 2, TEE_ERROR_BUSY);
+  static std::array<std::uint8_t, 4> buffer;
+  TEE_GenerateRandom(buffer.data(), 4);
+  const auto before = buffer;
+  EXPECT_EQ(run_guarded([] { TEE_GenerateRandom(buffer.data(), 4); }), TEE_ERROR_BUSY);
+  EXPECT_EQ(buffer, before);
 }
 
 TEST_F(OperationTest, EveryCallIsCountedUnderItsOwnName) {

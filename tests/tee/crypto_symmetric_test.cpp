@@ -74,6 +74,25 @@ TEST_F(DigestTest, FailedUpdatePoisonsUntilReset) {
   EXPECT_EQ(finish(digest, from_text("abc")).data, from_hex(known_digests[3].of_abc));
 }
 
+TEST_F(DigestTest, OrderedFailureOfAStepPoisonsToo) {
+  const operation_owner digest = keyless(TEE_ALG_SHA256, TEE_MODE_DIGEST, 0);
+  const operation_owner copy = keyless(TEE_ALG_SHA256, TEE_MODE_DIGEST, 0);
+  for (const char* step : {"TEE_DigestUpdate", "TEE_ResetOperation", "TEE_CopyOperation"}) {
+    faults().fail_call(step, 1, TEE_ERROR_BUSY);
+    TEE_DigestUpdate(digest.get(), "abc", 3);
+    TEE_CopyOperation(copy.get(), digest.get());
+    TEE_ResetOperation(digest.get());
+    EXPECT_TRUE(faults().triggered()) << step;
+    const bool reset_failed = step == std::string("TEE_ResetOperation");
+    EXPECT_EQ(finish(copy, {}).result, reset_failed ? TEE_SUCCESS : TEE_ERROR_GENERIC) << step;
+    EXPECT_EQ(finish(digest, {}).result, reset_failed ? TEE_ERROR_GENERIC : TEE_SUCCESS) << step;
+    faults().clear();
+    TEE_ResetOperation(digest.get());
+    TEE_ResetOperation(copy.get());
+    EXPECT_EQ(finish(digest, from_text("abc")).data, from_hex(known_digests[3].of_abc));
+  }
+}
+
 TEST_F(DigestTest, CopyGoesOnFromWhereTheSourceStood) {
   const operation_owner digest = keyless(TEE_ALG_SHA1, TEE_MODE_DIGEST, 0);
   const operation_owner copy = keyless(TEE_ALG_SHA1, TEE_MODE_DIGEST, 0);
@@ -183,6 +202,21 @@ TEST_F(MacTest, ShortBufferTakesNothingAndAFailedUpdatePoisonsUntilInit) {
   EXPECT_EQ(finish(mac, known.message).result, TEE_ERROR_GENERIC);
   TEE_MACInit(mac.get(), nullptr, 0);
   EXPECT_EQ(finish(mac, known.message).data, known.mac);
+}
+
+TEST_F(MacTest, OrderedFailureOfAStepPoisonsUntilInit) {
+  const known_mac known = known_macs()[3];
+  const operation_owner mac = operation_for(known.algorithm, TEE_MODE_MAC, secret_key(known.key_type, known.key));
+  for (const char* step : {"TEE_MACInit", "TEE_MACUpdate"}) {
+    faults().fail_call(step, 1, TEE_ERROR_BUSY);
+    TEE_MACInit(mac.get(), nullptr, 0);
+    TEE_MACUpdate(mac.get(), nullptr, 0);
+    const answer refusal = finish(mac, known.message);
+    EXPECT_EQ(refusal.result, TEE_ERROR_GENERIC) << step;
+    EXPECT_EQ(refusal.length, 0U) << step;
+    TEE_MACInit(mac.get(), nullptr, 0);
+    EXPECT_EQ(finish(mac, known.message).data, known.mac) << step;
+  }
 }
 
 TEST_F(MacTest, CopyGoesOnFromWhereTheSourceStood) {
@@ -354,6 +388,17 @@ TEST_F(CipherTest, FailedInitPoisonsUntilTheNext) {
   TEE_CipherInit(cipher.get(), nullptr, 16);
   EXPECT_EQ(update(cipher, repeated(1, 16), 16).result, TEE_ERROR_GENERIC);
   EXPECT_EQ(finish(cipher, {}, 0).result, TEE_ERROR_GENERIC);
+  init(cipher, from_hex(known.iv));
+  EXPECT_EQ(finish(cipher, from_hex(plain_blocks), 64).data, from_hex(known.cipher));
+}
+
+TEST_F(CipherTest, OrderedFailureOfTheInitPoisonsUntilTheNext) {
+  const known_cipher& known = known_ciphers[4];
+  const operation_owner cipher =
+      operation_for(known.algorithm, TEE_MODE_ENCRYPT, secret_key(TEE_TYPE_AES, from_hex(known.key)));
+  faults().fail_call("TEE_CipherInit", 1, TEE_ERROR_BUSY);
+  init(cipher, from_hex(known.iv));
+  EXPECT_EQ(finish(cipher, from_hex(plain_blocks), 64).result, TEE_ERROR_GENERIC);
   init(cipher, from_hex(known.iv));
   EXPECT_EQ(finish(cipher, from_hex(plain_blocks), 64).data, from_hex(known.cipher));
 }

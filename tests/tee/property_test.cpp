@@ -89,6 +89,14 @@ TEST_F(PropertyTest, BinaryBlocksAreBase64AsText) {
   EXPECT_EQ(text(TEE_PROPSET_TEE_IMPLEMENTATION, name).size(), (length + 2) / 3 * 4);
 }
 
+TEST_F(PropertyTest, WhatIsNotThereHasTheLevelZero) {
+  for (const char* name : {"gpd.tee.trustedStorage.antiRollback.protectionLevel", "gpd.tee.arith.maxBigIntSize"}) {
+    std::uint32_t number = 77;
+    EXPECT_EQ(TEE_GetPropertyAsU32(TEE_PROPSET_TEE_IMPLEMENTATION, name, &number), TEE_SUCCESS) << name;
+    EXPECT_EQ(number, 0U) << name;
+  }
+}
+
 TEST_F(PropertyTest, TheClientsIdentityIsItsLoginAndUuid) {
   ta.self().client = {TEE_LOGIN_USER, {0xABCDEF01, 2, 3, {4, 5, 6, 7, 8, 9, 10, 11}}};
   TEE_Identity identity{};

@@ -6,8 +6,11 @@
 #include <cstring>
 #include <ctime>
 #include <random>
+#include <stdexcept>
+#include <utility>
 #include <vector>
 
+#include "tee/runtime/platform_call.h"
 #include "tests/tee/scoped_instance.h"
 
 namespace hosted_tee::testing {
@@ -86,6 +89,17 @@ TEST(InstanceHeap, AFailedReallocationLeavesTheBlockAsItWas) {
   EXPECT_TRUE(heap.free(block));
 }
 
+TEST(InstanceHeap, BothBlocksCountWhileOneMovesToTheOther) {
+  constexpr std::uint32_t overhead = instance_heap::block_overhead;
+  instance_heap heap(40 + 2 * overhead);
+  void* block = heap.allocate(16, true);
+  EXPECT_EQ(heap.reallocate(block, 25), nullptr);
+  block = heap.reallocate(block, 24);
+  EXPECT_NE(block, nullptr);
+  EXPECT_EQ(heap.bytes(), 24 + overhead);
+  EXPECT_EQ(heap.peak(), 40 + 2 * overhead);
+}
+
 TEST(InstanceHeap, RecognisesWhatItDidNotHandOut) {
   instance_heap heap(4096);
   int foreign = 0;
@@ -130,29 +144,50 @@ TEST(InstanceHeap, ShowsEachBlockBeforeItIsFreedAlsoWhenItMoves) {
 TEST(FaultPlan, FailsTheNthCallOfOneFunctionOnce) {
   fault_plan faults;
   faults.fail_call("TEE_B", 2, TEE_ERROR_BUSY);
-  EXPECT_EQ(faults.on_call("TEE_B", true), std::nullopt);
-  EXPECT_EQ(faults.on_call("TEE_A", true), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_B", call_kind::fallible), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_A", call_kind::fallible), std::nullopt);
   EXPECT_FALSE(faults.triggered());
-  EXPECT_EQ(faults.on_call("TEE_B", true), TEE_ERROR_BUSY);
+  EXPECT_EQ(faults.on_call("TEE_B", call_kind::fallible), TEE_ERROR_BUSY);
   EXPECT_TRUE(faults.triggered());
-  EXPECT_EQ(faults.on_call("TEE_B", true), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_B", call_kind::fallible), std::nullopt);
 }
 
 TEST(FaultPlan, FailsTheNthOfAllCallsThatCanFail) {
   fault_plan faults;
-  (void)faults.on_call("TEE_A", true);
+  (void)faults.on_call("TEE_A", call_kind::fallible);
   faults.fail_any_call(2, TEE_ERROR_GENERIC);
-  EXPECT_EQ(faults.on_call("TEE_A", true), std::nullopt);
-  EXPECT_EQ(faults.on_call("TEE_MACInit", false), std::nullopt);
-  EXPECT_EQ(faults.on_call("TEE_B", true), TEE_ERROR_GENERIC);
+  EXPECT_EQ(faults.on_call("TEE_A", call_kind::fallible), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_MACInit", call_kind::step), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_B", call_kind::fallible), TEE_ERROR_GENERIC);
   EXPECT_EQ(faults.fallible_calls(), 3U);
+}
+
+TEST(FaultPlan, FailsAStepByItsNameAloneAndListsTheSteps) {
+  fault_plan faults;
+  faults.fail_any_call(1, TEE_ERROR_GENERIC);
+  faults.fail_call("TEE_MACInit", 2, TEE_ERROR_BUSY);
+  EXPECT_EQ(faults.on_call("TEE_MACInit", call_kind::step), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_DigestUpdate", call_kind::step), std::nullopt);
+  EXPECT_FALSE(faults.triggered());
+  EXPECT_EQ(faults.on_call("TEE_MACInit", call_kind::step), TEE_ERROR_BUSY);
+  EXPECT_EQ(faults.on_call("TEE_MACInit", call_kind::step), std::nullopt);
+  EXPECT_THAT(faults.steps(), ElementsAre("TEE_MACInit", "TEE_DigestUpdate"));
+  EXPECT_EQ(faults.fallible_calls(), 0U);
+}
+
+TEST(FaultPlan, NeverFailsWhatCannotFail) {
+  fault_plan faults;
+  faults.fail_call("TEE_Free", 1, TEE_ERROR_BUSY);
+  EXPECT_EQ(faults.on_call("TEE_Free", call_kind::infallible), std::nullopt);
+  EXPECT_FALSE(faults.triggered());
+  EXPECT_EQ(faults.call_count("TEE_Free"), 1U);
 }
 
 TEST(FaultPlan, CountsByNameWhereverTheNameLies) {
   fault_plan faults;
   const std::string copy = "TEE_A";
-  (void)faults.on_call("TEE_A", true);
-  (void)faults.on_call(copy.c_str(), false);
+  (void)faults.on_call("TEE_A", call_kind::fallible);
+  (void)faults.on_call(copy.c_str(), call_kind::infallible);
   EXPECT_EQ(faults.call_count("TEE_A"), 2U);
   EXPECT_EQ(faults.call_count("TEE_B"), 0U);
   faults.clear();
@@ -163,7 +198,7 @@ TEST(FaultPlan, CountsMoreNamesThanItWasMadeFor) {
   fault_plan faults;
   std::vector<std::string> names;
   for (int i = 0; i < 1000; ++i) names.push_back("TEE_" + std::to_string(i));
-  for (const std::string& name : names) (void)faults.on_call(name.c_str(), true);
+  for (const std::string& name : names) (void)faults.on_call(name.c_str(), call_kind::fallible);
   for (const std::string& name : names) EXPECT_EQ(faults.call_count(name), 1U) << name;
 }
 
@@ -180,6 +215,20 @@ TEST(FaultPlan, FalsifiesTheOutputOfTheNthCall) {
   EXPECT_EQ(result, TEE_ERROR_GENERIC);
 }
 
+TEST(FaultPlan, ShowsEachCallBeforeItHappens) {
+  scoped_instance ta;
+  std::vector<std::string> seen;
+  ta.faults().observe_calls([&](std::uint32_t number, std::string_view name) {
+    seen.push_back(std::to_string(number) + " " + std::string(name) + " " + std::to_string(ta.self().heap.blocks()));
+  });
+  TEE_Free(TEE_Malloc(1, 0));
+  (void)TEE_Wait(0);
+  EXPECT_THAT(seen, ElementsAre("1 TEE_Malloc 0", "2 TEE_Free 1", "3 TEE_Wait 0"));
+  ta.faults().clear();
+  TEE_Free(nullptr);
+  EXPECT_EQ(seen.size(), 3U);
+}
+
 TEST(FaultPlan, ClearForgetsOrdersButNotHowThePlatformIs) {
   fault_plan faults;
   faults.strict_gcm_tags(true);
@@ -187,7 +236,7 @@ TEST(FaultPlan, ClearForgetsOrdersButNotHowThePlatformIs) {
   faults.fail_any_call(1, TEE_ERROR_GENERIC);
   faults.clear();
   EXPECT_FALSE(faults.on_allocation());
-  EXPECT_EQ(faults.on_call("TEE_A", true), std::nullopt);
+  EXPECT_EQ(faults.on_call("TEE_A", call_kind::fallible), std::nullopt);
   EXPECT_TRUE(faults.strict_gcm_tags());
 }
 
@@ -323,6 +372,21 @@ TEST(Panic, LandsAtTheInnermostPlace) {
   const auto outer = run_guarded([] { inner = run_guarded([] { TEE_Panic(1); }); });
   EXPECT_EQ(inner, 1U);
   EXPECT_EQ(outer, std::nullopt);
+}
+
+TEST(PlatformCall, AnUnexpectedFailureLeavesNoLengthBehind) {
+  scoped_instance ta;
+  std::uint32_t length = 77;
+  const auto failing = [&](auto&& body) { return platform_call("TEE_Test", &length, body); };
+  EXPECT_EQ(failing([](const instance&) -> TEE_Result { throw std::bad_alloc(); }), TEE_ERROR_OUT_OF_MEMORY);
+  EXPECT_EQ(std::exchange(length, 77), 0U);
+  EXPECT_EQ(failing([](const instance&) -> TEE_Result { throw std::runtime_error(""); }), TEE_ERROR_GENERIC);
+  EXPECT_EQ(std::exchange(length, 77), 0U);
+  EXPECT_EQ(failing([](const instance&) -> TEE_Result { throw call_failure(TEE_ERROR_BUSY); }), TEE_ERROR_BUSY);
+  EXPECT_EQ(std::exchange(length, 77), 0U);
+  EXPECT_EQ(failing([](const instance&) -> TEE_Result { throw call_failure(TEE_ERROR_SHORT_BUFFER); }),
+            TEE_ERROR_SHORT_BUFFER);
+  EXPECT_EQ(length, 77U) << "the size that is needed, which the body put there";
 }
 
 TEST(BootSeed, IsThirtyTwoBytesOrNothing) {

@@ -13,7 +13,9 @@ namespace hosted_tee::testing {
 namespace {
 
 namespace fs = std::filesystem;
+using ::testing::EndsWith;
 using ::testing::HasSubstr;
+using ::testing::Not;
 
 class StateFolderTest : public ::testing::Test {
  protected:
@@ -127,7 +129,8 @@ TEST_F(StateFolderTest, WithDamagedFilesIsRefused) {
                                       {"private.db", "not a database"}}) {
     const std::string before = read(name);
     write(name, content);
-    EXPECT_EQ(fault().first, world_fault::corrupt) << name << ": " << content;
+    const bool is_text = name != std::string("private.db");
+    EXPECT_EQ(fault().first, is_text ? world_fault::malformed : world_fault::corrupt) << name << ": " << content;
     write(name, before);
   }
   EXPECT_EQ(fault().first, std::nullopt);
@@ -163,12 +166,47 @@ TEST_F(StateFolderTest, OptionsOfATestGoBeforeSettings) {
 
 TEST_F(StateFolderTest, NamesTheSettingThatItDoesNotKnow) {
   (void)open();
-  for (const char* line : {"rpmb = maybe", "color = red", "rpmb"}) {
-    write("settings", line);
+  for (const char* line : {"rpmb = maybe", "rpbm = off", "rpmb", "device-id = 7"}) {
+    write("settings", std::string("# a comment\n") + line + "\n");
     const auto [why, message] = fault();
-    EXPECT_EQ(why, world_fault::corrupt);
-    EXPECT_THAT(message, HasSubstr(line));
+    EXPECT_EQ(why, world_fault::malformed);
+    EXPECT_THAT(message, EndsWith(std::string("settings: can't make sense of line 2: ") + line));
   }
+}
+
+TEST_F(StateFolderTest, RefusesTwoSettingsOfOneName) {
+  (void)open();
+  for (const char* lines : {"rpmb = on\nrpmb = off", "rpmb = off\nrpmb = off",
+                            "device-id = 00112233-4455-6677-8899-aabbccddeeff\n"
+                            "device-id = 00112233-4455-6677-8899-aabbccddeeff",
+                            "gpd.tee.description = a\ngpd.tee.description = b"}) {
+    write("settings", lines);
+    const auto [why, message] = fault();
+    EXPECT_EQ(why, world_fault::malformed) << lines;
+    EXPECT_THAT(message, HasSubstr("line 2"));
+  }
+}
+
+TEST_F(StateFolderTest, AMalformedDeviceFileIsToldWithoutTheKeyInIt) {
+  (void)open();
+  const std::string device = read("device");
+  const std::string key = device.substr(device.find("storage-key = ") + 14, 64);
+  for (const std::string& content : {device + "0", "device-id = 7\n" + device, key, "storage-key = " + key + "0"}) {
+    write("device", content);
+    const auto [why, message] = fault();
+    EXPECT_EQ(why, world_fault::malformed);
+    EXPECT_THAT(message, HasSubstr("device"));
+    EXPECT_THAT(message, Not(HasSubstr(key.substr(0, 8))));
+  }
+}
+
+TEST_F(StateFolderTest, AnRpmbThatCantBeReadHasNotPassedItsCheck) {
+  const auto world = open();
+  // More than the database keeps in memory, so that it has to read.
+  world->write_object(::testing_support::keymaster_ta, TEE_STORAGE_RPMB, "large", std::string(8U << 20, 'x'));
+  EXPECT_TRUE(world->has_rpmb());
+  write("rpmb.db", std::string(4096, '?'));
+  EXPECT_FALSE(world->has_rpmb());
 }
 
 TEST_F(StateFolderTest, IsCompletedAfterACrashAtAnyStepOfItsMaking) {

@@ -81,6 +81,16 @@ TEST_F(ApplicationTest, AnIdThatBeginGetsTwiceCountsAsNone) {
   EXPECT_TRUE(client().begin(KM_PURPOSE_SIGN, import_fixed(512), twice).ok());
 }
 
+TEST_F(ApplicationTest, DataThatBeginGetsTwiceCountsAsNone) {
+  const param_list twice = signature(KM_DIGEST_NONE, KM_PAD_NONE)
+                               .add_blob(KM_TAG_APPLICATION_DATA, data)
+                               .add_blob(KM_TAG_APPLICATION_DATA, data);
+  const bytes bound = import_fixed(512, rsa_key(512).add_blob(KM_TAG_APPLICATION_DATA, data));
+  expect_failure(refused(KM_ERROR_INVALID_KEY_BLOB, {wrong_data, "Wrong AppId or AppData"}),
+                 [&] { return client().begin(KM_PURPOSE_SIGN, bound, twice); });
+  EXPECT_TRUE(client().begin(KM_PURPOSE_SIGN, import_fixed(512), twice).ok());
+}
+
 TEST_F(ApplicationTest, DeletingAsksForNoApplication) {
   const bytes blob = import_fixed(512, rsa_key(512).add_blob(KM_TAG_APPLICATION_ID, id));
   EXPECT_TRUE(client().delete_key(blob).ok());
