@@ -1,15 +1,22 @@
-"""Holds check-includes and check-banned to their rules: each finds what it must find in a made-up source tree, and
-nothing in the same tree without the fault.
+"""Holds the checks of the sources to their rules: each finds what it must find in a made-up source tree, and nothing
+in the same tree without the fault.
 
 usage: source_checks_test.py TOOLS_FOLDER
 """
 import importlib.machinery
 import importlib.util
+import json
 import pathlib
+import shutil
 import subprocess
 import sys
 import tempfile
 import unittest
+
+
+def run(check, root):
+    return subprocess.run([sys.executable, "-B", str(TOOLS / check), root], capture_output=True, text=True, check=False)
+
 
 HEADERS = [
     "src/ta/dispatch.h", "src/ta/algorithm_registry.h", "src/params/marshal.h", "src/params/keymaster_defs.h",
@@ -152,10 +159,42 @@ class SourceChecks(unittest.TestCase):
             (pathlib.Path(root) / "src").mkdir()
             (pathlib.Path(root) / "src/a.cpp").write_text('#include "nowhere.h"\nvoid f() { goto out; }\n', "utf-8")
             for name in ("check-includes", "check-banned"):
-                result = subprocess.run([sys.executable, "-B", str(TOOLS / name), root], capture_output=True, text=True,
-                                        check=False)
+                result = run(name, root)
                 self.assertEqual(result.returncode, 1, result.stderr)
                 self.assertIn("src/a.cpp:", result.stdout)
+
+    @unittest.skipIf(shutil.which("clang-format") is None, "clang-format is not installed")
+    def test_a_file_that_is_not_formatted_is_named(self):
+        with tempfile.TemporaryDirectory() as root:
+            (pathlib.Path(root) / "src").mkdir()
+            shutil.copy(TOOLS.parent / ".clang-format", root)
+            (pathlib.Path(root) / "src/good.cpp").write_text("int f() {\n  return 1;\n}\n", "utf-8")
+            self.assertEqual(run("check-format", root).returncode, 0)
+            (pathlib.Path(root) / "src/bad.cpp").write_text("int f()\n{return 1;}\n", "utf-8")
+            found = run("check-format", root)
+            self.assertEqual(found.returncode, 1)
+            self.assertIn("src/bad.cpp: not formatted", found.stdout)
+            self.assertNotIn("good.cpp", found.stdout)
+
+    @unittest.skipIf(shutil.which("run-clang-tidy") is None, "clang-tidy is not installed")
+    def test_a_finding_of_clang_tidy_is_shown_once(self):
+        with tempfile.TemporaryDirectory() as root:
+            tree, build = pathlib.Path(root).resolve(), pathlib.Path(root).resolve() / "build"
+            for folder in ("src", "tools", "build"):
+                (tree / folder).mkdir()
+            shutil.copy(TOOLS / "check-tidy", tree / "tools")
+            (tree / ".clang-tidy").write_text("Checks: '-*,modernize-use-nullptr'\nHeaderFilterRegex: '.*'\n", "utf-8")
+            units = [tree / "src/a.cpp", tree / "src/b.cpp"]
+            for unit in units:
+                unit.write_text('#include "p.h"\n', "utf-8")
+            (build / "compile_commands.json").write_text(json.dumps(
+                [{"directory": str(tree), "file": str(unit), "command": f"c++ -c {unit}"} for unit in units]), "utf-8")
+            for pointer, status in (("nullptr", 0), ("0", 1)):
+                (tree / "src/p.h").write_text(f"inline int* p() {{ return {pointer}; }}\n", "utf-8")
+                found = subprocess.run([sys.executable, "-B", tree / "tools/check-tidy", build], capture_output=True,
+                                       text=True, check=False)
+                self.assertEqual(found.returncode, status, found.stdout + found.stderr)
+                self.assertEqual(found.stdout.count("modernize-use-nullptr"), status)
 
     def test_each_banned_pattern_is_found_and_its_look_alikes_are_not(self):
         self.hold("check-banned", LINES, lambda text: text)
