@@ -2,6 +2,7 @@
 
 #include <cstring>
 
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 #include "platform/wipe.h"
 
@@ -33,38 +34,12 @@ void drop(TEE_ObjectHandle& place) {
   place = TEE_HANDLE_NULL;
 }
 
-/// Makes a 256-bit key object of `type` from a value.
-TEE_Result make_secret_object(uint32_t type, std::span<const uint8_t, ksk_size> value, object_handle& object) {
-  if (TEE_Result r = object.allocate(type, ksk_bits); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateTransientObject failed with 0x%08x\n", r);
-    return r;
-  }
-  TEE_Attribute secret;
-  TEE_InitRefAttribute(&secret, TEE_ATTR_SECRET_VALUE, value.data(), ksk_size);
-  if (TEE_Result r = TEE_PopulateTransientObject(object.get(), &secret, 1); r != TEE_SUCCESS) {
-    TRACE_ERROR("PopulateTransientObject failed with 0x%08x\n", r);
-    return r;
-  }
-  return TEE_SUCCESS;
-}
-
 /// Draws a fresh RPMB KSK and stores its value.
 TEE_Result create_rpmb_ksk(object_handle& ksk) {
-  if (TEE_Result r = ksk.allocate(TEE_TYPE_HMAC_SHA256, ksk_bits); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateTransientObject failed with 0x%08x\n", r);
-    return r;
-  }
-  if (TEE_Result r = TEE_GenerateKey(ksk.get(), ksk_bits, nullptr, 0); r != TEE_SUCCESS) {
-    TRACE_ERROR("GenerateKey failed with 0x%08x\n", r);
-    return r;
-  }
+  if (TEE_Result r = generate_secret_object(TEE_TYPE_HMAC_SHA256, ksk_bits, ksk); r != TEE_SUCCESS) return r;
   wiped_array<ksk_size> value;
-  uint32_t length = ksk_size;
-  if (TEE_Result r = TEE_GetObjectBufferAttribute(ksk.get(), TEE_ATTR_SECRET_VALUE, value.bytes, &length);
-      r != TEE_SUCCESS) {
-    TRACE_ERROR("GetObjectBufferAttribute failed with 0x%08x\n", r);
-    return r;
-  }
+  uint32_t length = 0;
+  if (TEE_Result r = read_secret_value(ksk, value.bytes, &length); r != TEE_SUCCESS) return r;
   if (length != ksk_size) {
     TRACE_ERROR("Wrong key size, expected %dB, got %dB", ksk_size, length);
     return TEE_ERROR_GENERIC;
@@ -120,7 +95,7 @@ TEE_Result load_rpmb_ksk(persistent_object& stored, object_handle& ksk) {
     TRACE_ERROR("Wrong persistent data length, expected %dB, got %dB", ksk_size, length);
     return delete_rpmb_ksk(stored);
   }
-  return make_secret_object(TEE_TYPE_HMAC_SHA256, value.bytes, ksk);
+  return make_secret_object(TEE_TYPE_HMAC_SHA256, ksk_bits, value.bytes, ksk);
 }
 
 }  // namespace
@@ -171,7 +146,7 @@ TEE_Result key_store_init_derived_ksk() {
   static_assert(sizeof device_id == 16);
   std::memcpy(value.bytes, &device_id, sizeof device_id);
   object_handle ksk;
-  if (TEE_Result r = make_secret_object(TEE_TYPE_HMAC_SHA256, value.bytes, ksk); r != TEE_SUCCESS) return r;
+  if (TEE_Result r = make_secret_object(TEE_TYPE_HMAC_SHA256, ksk_bits, value.bytes, ksk); r != TEE_SUCCESS) return r;
   keep(the_derived_ksk, ksk);
   return TEE_SUCCESS;
 }
@@ -226,7 +201,7 @@ TEE_Result TEE_DeriveKK(TEE_ObjectHandle ksk, std::span<const uint8_t, blob_nonc
     return TEE_ERROR_BAD_PARAMETERS;
   }
   object_handle key;
-  if (TEE_Result r = make_secret_object(blob_key_type, mac.bytes, key); r != TEE_SUCCESS) return r;
+  if (TEE_Result r = make_secret_object(blob_key_type, ksk_bits, mac.bytes, key); r != TEE_SUCCESS) return r;
   *blob_key = key.release();
   return TEE_SUCCESS;
 }

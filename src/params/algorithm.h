@@ -4,6 +4,7 @@
 #define KEYMASTER_PARAMS_ALGORITHM_H_
 
 #include <cstdint>
+#include <cstring>
 #include <span>
 
 #include "params/key_param.h"
@@ -17,6 +18,12 @@ namespace keymaster {
 inline constexpr int parameter_found = 0;
 inline constexpr int parameter_not_applicable = 1;
 
+/// An operation_constructor builds an algorithm's record, or answers null and says why: a platform failure in
+/// `*result`, a Keymaster error in `*error`, either of which may stay zero. A failure leaves nothing behind, and no
+/// parameter in `request.out_params`.
+using operation_constructor = keymaster_operation_t* (*)(const operation_request& request, TEE_Result* result,
+                                                         keymaster_error_t* error);
+
 /// What an algorithm offers for one purpose.
 struct keymaster_purpose_ops {
   uint32_t (*get_support_block_mode_cnt)();
@@ -26,11 +33,7 @@ struct keymaster_purpose_ops {
   uint32_t (*get_support_digest_cnt)();
   void (*get_support_digest)(uint32_t* digests);
 
-  /// create_operation builds the algorithm's record, or answers null and says why: a platform failure in `*result`, a
-  /// Keymaster error in `*error`, either of which may stay zero. A failure leaves nothing behind, and no parameter in
-  /// `request.out_params`.
-  keymaster_operation_t* (*create_operation)(const operation_request& request, TEE_Result* result,
-                                             keymaster_error_t* error);
+  operation_constructor create_operation;
 
   /// What `params` ask for: parameter_found and the value, or parameter_not_applicable and the value untouched.
   int (*get_padding)(const keymaster_key_param_set_t& params, uint32_t* padding);
@@ -69,6 +72,19 @@ struct constant_list {
     if constexpr (List.size() != 0) std::memcpy(static_cast<void*>(values), List.data(), sizeof List);
   }
 };
+
+/// never_applicable is the answer of an algorithm without paddings or without block modes.
+inline int never_applicable(const keymaster_key_param_set_t& /*params*/, uint32_t* /*value*/) {
+  return parameter_not_applicable;
+}
+
+/// unique_digest answers the one digest that `params` name.
+inline int unique_digest(const keymaster_key_param_set_t& params, uint32_t* digest) {
+  const keymaster_key_param_t* const param = key_param_set_get_unique(params, KM_TAG_DIGEST);
+  if (param == nullptr) return parameter_not_applicable;
+  *digest = param->enumerated;
+  return parameter_found;
+}
 
 }  // namespace keymaster
 

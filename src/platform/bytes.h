@@ -69,6 +69,13 @@ class basic_bytes {
     size_ = size;
   }
 
+  /// shorten gives up all but the first `size` bytes; the block stays as it is, and the rest of it is wiped.
+  void shorten(uint32_t size) {
+    if (size >= size_) return;
+    wipe(data_ + size, size_ - size);
+    size_ = size;
+  }
+
   /// release hands the block on; the new owner frees it with TEE_Free.
   [[nodiscard]] uint8_t* release() {
     size_ = 0;

@@ -51,11 +51,28 @@ secret_bytes uncompressed_point(bytes_view x, bytes_view y, std::size_t field_by
   return point;
 }
 
+secret_bytes read_order(const curve_row& curve) {
+  const auto group = owned<ec_group>(EC_GROUP_new_by_curve_name(EC_curve_nist2nid(curve.name)));
+  const BIGNUM* const order = EC_GROUP_get0_order(group.get());
+  secret_bytes number(static_cast<std::size_t>(BN_num_bytes(order)));
+  BN_bn2bin(order, number.data());
+  return number;
+}
+
+/// order_of looks the order of a curve's base point up. libcrypto is asked once: it makes the whole curve anew for the
+/// answer.
+const secret_bytes& order_of(const curve_row& curve) {
+  static const auto* const orders =
+      new std::array<secret_bytes, curves.size()>{read_order(curves[0]), read_order(curves[1]), read_order(curves[2]),
+                                                  read_order(curves[3]), read_order(curves[4])};
+  return orders->at(static_cast<std::size_t>(&curve - curves.data()));
+}
+
 /// is_below_order: libcrypto takes any private value, also those with which a signature can't verify.
-bool is_below_order(bytes_view number, const evp_key& key) {
-  const secret_bytes order = number_of(key, OSSL_PKEY_PARAM_EC_ORDER);
-  const secret_bytes padded = right_aligned(number, order.size());
-  return padded < order;
+bool is_below_order(bytes_view number, const curve_row& curve) {
+  const secret_bytes& order = order_of(curve);
+  if (number.size() > order.size()) return false;
+  return right_aligned(number, order.size()) < order;
 }
 
 stored_attribute stored_curve(const curve_row& curve) {
@@ -91,7 +108,7 @@ key_material ec_from_attributes(const object_type& /*type*/, std::uint32_t max_b
   refuse_unless(!d.empty(), TEE_ERROR_BAD_PARAMETERS);
   params.add_number(OSSL_PKEY_PARAM_PRIV_KEY, d);
   material.key = params.build("EC", EVP_PKEY_KEYPAIR);
-  refuse_unless(is_below_order(d, material.key), TEE_ERROR_BAD_PARAMETERS);
+  refuse_unless(is_below_order(d, curve), TEE_ERROR_BAD_PARAMETERS);
   material.attributes.push_back(stored(TEE_ATTR_ECC_PRIVATE_VALUE, d));
   return material;
 }

@@ -29,6 +29,7 @@ using evp_mac = std::unique_ptr<EVP_MAC, freed_by<EVP_MAC_free>>;
 using evp_mac_context = std::unique_ptr<EVP_MAC_CTX, freed_by<EVP_MAC_CTX_free>>;
 using evp_key = std::unique_ptr<EVP_PKEY, freed_by<EVP_PKEY_free>>;
 using evp_key_context = std::unique_ptr<EVP_PKEY_CTX, freed_by<EVP_PKEY_CTX_free>>;
+using ec_group = std::unique_ptr<EC_GROUP, freed_by<EC_GROUP_free>>;
 using ecdsa_signature = std::unique_ptr<ECDSA_SIG, freed_by<ECDSA_SIG_free>>;
 
 /// owned takes what a libcrypto constructor returned; null means that the host ran out of memory.

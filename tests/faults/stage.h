@@ -4,6 +4,7 @@
 
 #include <functional>
 #include <ostream>
+#include <string>
 
 #include "src/params/keymaster_defs.h"
 #include "tests/support/device_fixture.h"
@@ -46,7 +47,7 @@ using act = std::function<void(stage&)>;
 /// One command in one situation. A command that fails without a fault is a scenario too: it may then fail otherwise,
 /// but it must still fail.
 struct scenario {
-  const char* name;
+  std::string name;
   act arrange;                        // once: keys, clocks
   act approach;                       // before each run: the operation that the command needs; may be empty
   std::function<answer(stage&)> run;  // the command
@@ -55,6 +56,8 @@ struct scenario {
   std::int32_t error = 0;
   bool zeroes_response = false;  // on failure, over the whole capacity
   bool rpmb = true;
+  bool begins = false;                // the operation is the one that the command itself begins
+  bool may_outlive_platform = false;  // the command doesn't ask how one of its platform calls ended
 };
 
 /// How a scenario shows in a test's output.
@@ -67,6 +70,7 @@ std::vector<scenario> key_scenarios();
 std::vector<scenario> begin_scenarios();
 std::vector<scenario> step_scenarios();
 std::vector<scenario> finish_scenarios();
+std::vector<scenario> algorithm_scenarios();
 
 }  // namespace testing_support
 

@@ -55,6 +55,14 @@ void choose_padding(EVP_PKEY_CTX* context, std::uint32_t padding, int salt) {
   if (pss) must(EVP_PKEY_CTX_set_rsa_pss_saltlen(context, salt) == 1, "salt length");
 }
 
+void choose_encryption(EVP_PKEY_CTX* context, std::uint32_t padding, std::uint32_t digest) {
+  const bool oaep = padding == KM_PAD_RSA_OAEP;
+  must(EVP_PKEY_CTX_set_rsa_padding(context, oaep ? RSA_PKCS1_OAEP_PADDING : RSA_PKCS1_PADDING) == 1, "padding");
+  if (!oaep) return;
+  must(EVP_PKEY_CTX_set_rsa_oaep_md(context, digest_of(digest)) == 1, "digest");
+  must(EVP_PKEY_CTX_set_rsa_mgf1_md(context, EVP_sha1()) == 1, "mask");
+}
+
 using bare_function = int (*)(EVP_PKEY_CTX*, unsigned char*, std::size_t*, const unsigned char*, std::size_t);
 
 bytes bare(EVP_PKEY* key, int (*init)(EVP_PKEY_CTX*), bare_function run, const bytes& block) {
@@ -116,6 +124,32 @@ bool rsa_test_key::verifies(std::uint32_t digest, std::uint32_t padding, const b
   must(EVP_DigestVerifyInit(context.get(), &rsa, digest_of(digest), nullptr, key_.get()) == 1, "EVP_DigestVerifyInit");
   choose_padding(rsa, padding, salt);
   return EVP_DigestVerify(context.get(), signature.data(), signature.size(), message.data(), message.size()) == 1;
+}
+
+bytes rsa_test_key::encrypt(std::uint32_t digest, std::uint32_t padding, const bytes& message) const {
+  const key_context context(EVP_PKEY_CTX_new(key_.get(), nullptr), EVP_PKEY_CTX_free);
+  must(EVP_PKEY_encrypt_init(context.get()) == 1, "EVP_PKEY_encrypt_init");
+  choose_encryption(context.get(), padding, digest);
+  bytes ciphertext(size());
+  std::size_t length = ciphertext.size();
+  const std::uint8_t nothing = 0;
+  must(EVP_PKEY_encrypt(context.get(), ciphertext.data(), &length, message.empty() ? &nothing : message.data(),
+                        message.size()) == 1,
+       "encrypting");
+  return ciphertext;
+}
+
+std::optional<bytes> rsa_test_key::decrypt(std::uint32_t digest, std::uint32_t padding, const bytes& ciphertext) const {
+  const key_context context(EVP_PKEY_CTX_new(key_.get(), nullptr), EVP_PKEY_CTX_free);
+  must(EVP_PKEY_decrypt_init(context.get()) == 1, "EVP_PKEY_decrypt_init");
+  choose_encryption(context.get(), padding, digest);
+  bytes message(size());
+  std::size_t length = message.size();
+  if (EVP_PKEY_decrypt(context.get(), message.data(), &length, ciphertext.data(), ciphertext.size()) != 1) {
+    return std::nullopt;
+  }
+  message.resize(length);
+  return message;
 }
 
 bytes rsa_test_key::private_operation(const bytes& block) const {

@@ -6,6 +6,7 @@
 
 #include <array>
 #include <memory>
+#include <optional>
 
 #include "tests/support/bytes.h"
 
@@ -41,6 +42,12 @@ class rsa_test_key {
                            int salt = salt_as_digest) const;
   [[nodiscard]] bool verifies(std::uint32_t digest, std::uint32_t padding, const bytes& message, const bytes& signature,
                               int salt = salt_any) const;
+
+  /// encrypt and decrypt pad with PKCS#1 v1.5 or OAEP, the latter with `digest` for the label and SHA-1 for the mask.
+  /// decrypt answers nothing for what is not so padded.
+  [[nodiscard]] bytes encrypt(std::uint32_t digest, std::uint32_t padding, const bytes& message) const;
+  [[nodiscard]] std::optional<bytes> decrypt(std::uint32_t digest, std::uint32_t padding,
+                                             const bytes& ciphertext) const;
 
   /// The bare operations over a block of size() bytes.
   [[nodiscard]] bytes private_operation(const bytes& block) const;

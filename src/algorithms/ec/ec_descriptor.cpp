@@ -1,20 +1,57 @@
 #include "algorithms/ec/ec_descriptor.h"
 
-namespace keymaster {
+#include <array>
 
-// The algorithm has its place in the registry and no entries yet: every command answers as for an algorithm that serves
-// no purpose and no format.
+#include "algorithms/ec/ec_key.h"
+#include "algorithms/ec/ec_operation.h"
+
+namespace keymaster {
+namespace {
+
+constexpr std::array<uint32_t, 0> block_modes = {};
+constexpr std::array<uint32_t, 0> paddings = {};
+constexpr std::array<uint32_t, 6> digests = {KM_DIGEST_NONE,      KM_DIGEST_SHA1,      KM_DIGEST_SHA_2_224,
+                                             KM_DIGEST_SHA_2_256, KM_DIGEST_SHA_2_384, KM_DIGEST_SHA_2_512};
+constexpr std::array<uint32_t, 1> import_formats = {KM_KEY_FORMAT_PKCS8};
+constexpr std::array<uint32_t, 1> export_formats = {KM_KEY_FORMAT_X509};
+
+constexpr keymaster_purpose_ops signature_ops(operation_constructor create) {
+  return {
+      .get_support_block_mode_cnt = constant_list<block_modes>::count,
+      .get_support_block_mode = constant_list<block_modes>::copy,
+      .get_support_padding_mode_cnt = constant_list<paddings>::count,
+      .get_support_padding_mode = constant_list<paddings>::copy,
+      .get_support_digest_cnt = constant_list<digests>::count,
+      .get_support_digest = constant_list<digests>::copy,
+      .create_operation = create,
+      .get_padding = never_applicable,
+      .get_block_mode = never_applicable,
+      .get_digest = unique_digest,
+  };
+}
+
+constexpr keymaster_purpose_ops sign_ops = signature_ops(create_ec_sign);
+constexpr keymaster_purpose_ops verify_ops = signature_ops(create_ec_verify);
+
+const keymaster_purpose_ops* ec_get_purpose_ops(uint32_t purpose) {
+  if (purpose == KM_PURPOSE_SIGN) return &sign_ops;
+  if (purpose == KM_PURPOSE_VERIFY) return &verify_ops;
+  return nullptr;
+}
+
+}  // namespace
+
 constinit const keymaster_algorithm_descriptor ec_descriptor = {
     .algorithm = KM_ALGORITHM_EC,
     .name = "EC",
-    .get_purpose_ops = nullptr,
-    .get_support_import_format_cnt = nullptr,
-    .get_support_import_format = nullptr,
-    .get_support_export_format_cnt = nullptr,
-    .get_support_export_format = nullptr,
-    .generate_key = nullptr,
-    .import_key = nullptr,
-    .export_key = nullptr,
+    .get_purpose_ops = ec_get_purpose_ops,
+    .get_support_import_format_cnt = constant_list<import_formats>::count,
+    .get_support_import_format = constant_list<import_formats>::copy,
+    .get_support_export_format_cnt = constant_list<export_formats>::count,
+    .get_support_export_format = constant_list<export_formats>::copy,
+    .generate_key = ec_generate_key,
+    .import_key = ec_import_key,
+    .export_key = ec_export_key,
 };
 
 }  // namespace keymaster

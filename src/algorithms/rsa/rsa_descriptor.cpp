@@ -3,6 +3,7 @@
 #include <array>
 #include <cstring>
 
+#include "algorithms/rsa/rsa_cipher.h"
 #include "algorithms/rsa/rsa_key.h"
 #include "algorithms/rsa/rsa_sign.h"
 #include "algorithms/rsa/rsa_verify.h"
@@ -11,6 +12,9 @@ namespace keymaster {
 namespace {
 
 constexpr std::array<uint32_t, 0> block_modes = {};
+constexpr std::array<uint32_t, 3> cipher_paddings = {KM_PAD_NONE, KM_PAD_RSA_OAEP, KM_PAD_RSA_PKCS1_1_5_ENCRYPT};
+constexpr std::array<uint32_t, 6> cipher_digests = {KM_DIGEST_NONE,      KM_DIGEST_SHA1,      KM_DIGEST_SHA_2_224,
+                                                    KM_DIGEST_SHA_2_256, KM_DIGEST_SHA_2_384, KM_DIGEST_SHA_2_512};
 constexpr std::array<uint32_t, 3> signature_paddings = {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN};
 constexpr std::array<uint32_t, 7> signature_digests = {KM_DIGEST_NONE,      KM_DIGEST_MD5,       KM_DIGEST_SHA1,
                                                        KM_DIGEST_SHA_2_224, KM_DIGEST_SHA_2_256, KM_DIGEST_SHA_2_384,
@@ -25,10 +29,6 @@ int rsa_get_padding(const keymaster_key_param_set_t& params, uint32_t* padding) 
   return parameter_found;
 }
 
-int rsa_get_block_mode(const keymaster_key_param_set_t&, uint32_t*) {
-  return parameter_not_applicable;
-}
-
 /// The digest counts where it says what is signed. With an encryption padding it is part of the padding, which the
 /// key's list of digests does not restrict.
 int rsa_get_digest(const keymaster_key_param_set_t& params, uint32_t* digest) {
@@ -37,35 +37,36 @@ int rsa_get_digest(const keymaster_key_param_set_t& params, uint32_t* digest) {
   if (padding != KM_PAD_NONE && padding != KM_PAD_RSA_PSS && padding != KM_PAD_RSA_PKCS1_1_5_SIGN) {
     return parameter_not_applicable;
   }
-  const keymaster_key_param_t* const param = key_param_set_get_unique(params, KM_TAG_DIGEST);
-  if (param == nullptr) return parameter_not_applicable;
-  *digest = param->enumerated;
-  return parameter_found;
+  return unique_digest(params, digest);
 }
 
-constexpr keymaster_purpose_ops signature_ops(keymaster_operation_t* (*create)(const operation_request&, TEE_Result*,
-                                                                               keymaster_error_t*)) {
+template <const auto& Paddings, const auto& Digests>
+constexpr keymaster_purpose_ops purpose_ops(operation_constructor create) {
   return {
       .get_support_block_mode_cnt = constant_list<block_modes>::count,
       .get_support_block_mode = constant_list<block_modes>::copy,
-      .get_support_padding_mode_cnt = constant_list<signature_paddings>::count,
-      .get_support_padding_mode = constant_list<signature_paddings>::copy,
-      .get_support_digest_cnt = constant_list<signature_digests>::count,
-      .get_support_digest = constant_list<signature_digests>::copy,
+      .get_support_padding_mode_cnt = constant_list<Paddings>::count,
+      .get_support_padding_mode = constant_list<Paddings>::copy,
+      .get_support_digest_cnt = constant_list<Digests>::count,
+      .get_support_digest = constant_list<Digests>::copy,
       .create_operation = create,
       .get_padding = rsa_get_padding,
-      .get_block_mode = rsa_get_block_mode,
+      .get_block_mode = never_applicable,
       .get_digest = rsa_get_digest,
   };
 }
 
-constexpr keymaster_purpose_ops sign_ops = signature_ops(create_rsa_sign);
-constexpr keymaster_purpose_ops verify_ops = signature_ops(create_rsa_verify);
+/// A record's place is the purpose's value.
+constexpr std::array<keymaster_purpose_ops, 4> purposes = {
+    purpose_ops<cipher_paddings, cipher_digests>(create_rsa_encrypt),
+    purpose_ops<cipher_paddings, cipher_digests>(create_rsa_decrypt),
+    purpose_ops<signature_paddings, signature_digests>(create_rsa_sign),
+    purpose_ops<signature_paddings, signature_digests>(create_rsa_verify),
+};
+static_assert(KM_PURPOSE_ENCRYPT == 0 && KM_PURPOSE_DECRYPT == 1 && KM_PURPOSE_SIGN == 2 && KM_PURPOSE_VERIFY == 3);
 
 const keymaster_purpose_ops* rsa_get_purpose_ops(uint32_t purpose) {
-  if (purpose == KM_PURPOSE_SIGN) return &sign_ops;
-  if (purpose == KM_PURPOSE_VERIFY) return &verify_ops;
-  return nullptr;
+  return purpose < purposes.size() ? &purposes[purpose] : nullptr;
 }
 
 }  // namespace

@@ -37,14 +37,6 @@ struct rsa_operation_t : keymaster_operation_t {
 /// nothing was taken. `*total` is how many bytes there are, or would be.
 [[nodiscard]] bool gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit, uint32_t* total);
 
-/// finish_record hands out `op` when its set-up succeeded, and deletes it otherwise.
-template <class Record>
-[[nodiscard]] keymaster_operation_t* finish_record(Record* op, TEE_Result result, keymaster_error_t error) {
-  if (result == TEE_SUCCESS && error == KM_ERROR_OK) return op;
-  delete_record(op);
-  return nullptr;
-}
-
 /// missing_members counts which of key, operation and buffer a record lacks; freeing it traces a line for each.
 [[nodiscard]] uint32_t missing_members(const rsa_operation_t& op);
 

@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "algorithms/rsa/rsa_signature_scheme.h"
+#include "params/operation_record.h"
 #include "platform/trace.h"
 #include "soter/soter_enhance.h"
 #include "soter/soter_init.h"
@@ -124,19 +125,16 @@ TEE_Result sign_statement(rsa_sign_operation_t& op, const keymaster_key_param_se
 }  // namespace
 
 keymaster_operation_t* create_rsa_sign(const operation_request& request, TEE_Result* result, keymaster_error_t* error) {
-  rsa_sign_operation_t* const op = new_record<rsa_sign_operation_t>();
+  auto* const op =
+      new_operation<rsa_sign_operation_t>({KM_PURPOSE_SIGN, rsa_sign_free, rsa_sign_update, rsa_sign_finish});
   if (op == nullptr) {
     TRACE_ERROR("Out of memory");
     *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
     return nullptr;
   }
-  op->free = rsa_sign_free;
-  op->update = rsa_sign_update;
-  op->finish = rsa_sign_finish;
-  op->purpose = KM_PURPOSE_SIGN;
   *error = prepare_soter(*op, request.characteristics);
   if (*error == KM_ERROR_OK) *result = prepare_signature_operation(*op, request, error);
-  return finish_record(op, *result, *error);
+  return finish_operation_record(op, *result, *error);
 }
 
 TEE_Result rsa_sign_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,

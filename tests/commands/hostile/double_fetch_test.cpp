@@ -7,6 +7,8 @@
 
 #include "tests/commands/command_fixture.h"
 #include "tests/commands/raw_session.h"
+#include "tests/support/ec_test_key.h"
+#include "tests/support/hmac_test_key.h"
 
 using namespace keymaster;
 
@@ -154,6 +156,35 @@ TEST_F(DoubleFetchTest, ASignatureThatChangesWhileItIsVerified) {
       return session.call(KM_COMMAND_FINISH, handle, memref(request), memref(response));
     });
   }
+}
+
+TEST_F(DoubleFetchTest, EcMaterialThatChangesWhileItIsImported) {
+  const bytes params = ec_key(256).marshal();
+  const ec_test_key& key = ec_test_key::of_bits(256);
+  bytes request = join({prefixed(params), key.material()});
+  const std::size_t material = 4 + params.size(), y = material + 8 + key.fields().x.size();
+  attack(request, {0, 4, material, material + 4, y, y + 4 + key.fields().y.size()},
+         [&] { return session.call(KM_COMMAND_IMPORT_KEY, 0, memref(request), memref(response)); });
+}
+
+TEST_F(DoubleFetchTest, AnEcSignatureThatChangesWhileItIsVerified) {
+  // The coder reads lengths of its own inside the signature.
+  const ec_test_key& key = ec_test_key::of_bits(256);
+  const bytes pair = client().must_import(ec_key(256), key.material());
+  bytes request = join({prefixed(key.sign(KM_DIGEST_SHA_2_256, from_text("message"))), prefixed(u32(0))});
+  attack(request, {0, 4, 6, 38, 40}, [&] {
+    const std::uint32_t handle = client().must_begin(KM_PURPOSE_VERIFY, pair, ec_digest(KM_DIGEST_SHA_2_256));
+    return session.call(KM_COMMAND_FINISH, handle, memref(request), memref(response));
+  });
+}
+
+TEST_F(DoubleFetchTest, AMacThatChangesWhileItIsVerified) {
+  const bytes secret = client().must_import(hmac_key(KM_DIGEST_SHA_2_256, 256), pattern(32));
+  bytes request = join({prefixed(pattern(32)), prefixed(u32(0))});
+  attack(request, {0, 4, 32, 36, 40}, [&] {
+    const std::uint32_t handle = client().must_begin(KM_PURPOSE_VERIFY, secret, hmac_length(256));
+    return session.call(KM_COMMAND_FINISH, handle, memref(request), memref(response));
+  });
 }
 
 }  // namespace

@@ -162,13 +162,6 @@ TEST_F(GenerateTest, AnAlgorithmThatNobodyServesIsRefusedWithoutALine) {
   }
 }
 
-// A row leaves this table when the algorithm's key module arrives.
-TEST_F(GenerateTest, AlgorithmsWithoutAKeyModuleAreRefusedWithoutALine) {
-  for (const std::uint32_t algorithm : {KM_ALGORITHM_EC, KM_ALGORITHM_AES, KM_ALGORITHM_HMAC}) {
-    expect_refused(refused(KM_ERROR_UNSUPPORTED_ALGORITHM, {}), param_list{}.add(KM_TAG_ALGORITHM, algorithm));
-  }
-}
-
 TEST_F(GenerateTest, AClientMayNotStateTheOrigin) {
   for (const std::uint32_t origin : {KM_ORIGIN_GENERATED, KM_ORIGIN_IMPORTED}) {
     expect_refused(refused(KM_ERROR_INVALID_ARGUMENT, {"Shouldn't specify KM_TAG_ORIGIN"}),

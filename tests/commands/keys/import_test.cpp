@@ -177,20 +177,6 @@ TEST_F(ImportTest, TheAlgorithmMustOccurOnceAndBeServed) {
   }
 }
 
-// A row leaves this table when the algorithm's key module arrives.
-TEST_F(ImportTest, AlgorithmsWithoutAKeyModuleAreNamedInTheRefusal) {
-  struct named {
-    std::uint32_t algorithm;
-    const char* line;
-  };
-  for (const named& each : {named{KM_ALGORITHM_AES, "Unsupport import_key for algorithm AES (32)"},
-                            {KM_ALGORITHM_EC, "Unsupport import_key for algorithm EC (3)"},
-                            {KM_ALGORITHM_HMAC, "Unsupport import_key for algorithm HMAC (128)"}}) {
-    expect_refused(refused(KM_ERROR_UNSUPPORTED_ALGORITHM, {each.line}),
-                   param_list{}.add(KM_TAG_ALGORITHM, each.algorithm), pattern(16));
-  }
-}
-
 TEST_F(ImportTest, BlobUsageIsStatedAtMostOnceAndTheMaterialIsLookedAtFirst) {
   const param_list twice = rsa_key(1024).add(KM_TAG_BLOB_USAGE_REQUIREMENTS).add(KM_TAG_BLOB_USAGE_REQUIREMENTS);
   expect_refused(refused(KM_ERROR_INVALID_TAG, {"Too many KM_TAG_BLOB_USAGE_REQUIREMENTS specified"}), twice,

@@ -5,6 +5,7 @@
 #include <set>
 
 #include "tests/commands/command_fixture.h"
+#include "tests/support/ec_test_key.h"
 
 using namespace keymaster;
 
@@ -117,10 +118,10 @@ TEST_F(BeginTest, PurposesThatNobodyServesAreRefused) {
   }
 }
 
-// This row goes when RSA encryption arrives.
 TEST_F(BeginTest, APurposeWithoutAConstructorIsNamedInTheRefusal) {
-  expect_refused(refused(KM_ERROR_UNSUPPORTED_PURPOSE, {"Algorithm RSA purpose 0 not implemented"}), KM_PURPOSE_ENCRYPT,
-                 blob, raw);
+  const bytes pair = client().must_import(ec_key(256), ec_test_key::of_bits(256).material());
+  expect_refused(refused(KM_ERROR_UNSUPPORTED_PURPOSE, {"Algorithm EC purpose 0 not implemented"}), KM_PURPOSE_ENCRYPT,
+                 pair, raw);
 }
 
 TEST_F(BeginTest, AKeyThatNeedsATokenForEachOperationBegins) {
