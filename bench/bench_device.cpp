@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 #include "src/params/keymaster_defs.h"
 #include "src/params/keymaster_protocol.h"
@@ -20,60 +21,31 @@ void must(bool done, const char* what) {
   if (!done) throw std::runtime_error(what);
 }
 
-void append_u64(bytes& body, std::uint64_t value) {
-  append_u32(body, static_cast<std::uint32_t>(value));
-  append_u32(body, static_cast<std::uint32_t>(value >> 32));
-}
-
 }  // namespace
 
-void append_u32(bytes& body, std::uint32_t value) {
-  for (int shift = 0; shift < 32; shift += 8) body.push_back(static_cast<std::uint8_t>(value >> shift));
-}
-
-void append_block(bytes& body, const bytes& block) {
-  append_u32(body, static_cast<std::uint32_t>(block.size()));
-  body.insert(body.end(), block.begin(), block.end());
-}
-
-std::uint32_t u32_at(const bytes& data, std::size_t offset) {
-  std::uint32_t value = 0;
-  for (std::size_t i = 0; i < 4; ++i) value |= std::uint32_t{data.at(offset + i)} << (8 * i);
-  return value;
-}
-
-bytes marshal(std::initializer_list<std::pair<std::uint32_t, std::uint64_t>> params) {
-  bytes body;
-  append_u32(body, static_cast<std::uint32_t>(params.size()));
-  for (const auto& [tag, value] : params) {
-    append_u32(body, tag);
-    append_u32(body, 0);
-    append_u64(body, value);
-    append_u64(body, 0);
-  }
-  return body;
-}
-
-bytes rsa_sign_key(std::uint32_t bits) {
-  return marshal({{KM_TAG_ALGORITHM, KM_ALGORITHM_RSA},
-                  {KM_TAG_KEY_SIZE, bits},
-                  {KM_TAG_RSA_PUBLIC_EXPONENT, 65537},
-                  {KM_TAG_PURPOSE, KM_PURPOSE_SIGN},
-                  {KM_TAG_DIGEST, KM_DIGEST_SHA_2_256},
-                  {KM_TAG_PADDING, KM_PAD_RSA_PKCS1_1_5_SIGN},
-                  {KM_TAG_NO_AUTH_REQUIRED, 1}});
-}
-
-bytes rsa_sign_params() {
-  return marshal({{KM_TAG_DIGEST, KM_DIGEST_SHA_2_256}, {KM_TAG_PADDING, KM_PAD_RSA_PKCS1_1_5_SIGN}});
-}
-
-bench_device::bench_device() {
+temporary_folder::temporary_folder() {
   std::string name = (std::filesystem::temp_directory_path() / "keymaster-bench-XXXXXX").string();
   must(mkdtemp(name.data()) != nullptr, "no temporary folder");
-  folder_ = name;
+  path_ = name;
+}
+
+temporary_folder::~temporary_folder() {
+  std::error_code ignored;
+  std::filesystem::remove_all(path_, ignored);
+}
+
+bench_device::bench_device() : own_folder_(std::in_place), state_(own_folder_->path() / "state") {
+  start();
+}
+
+bench_device::bench_device(std::filesystem::path state) : state_(std::move(state)) {
+  start();
+}
+
+void bench_device::start() {
   hosted_tee::world_options options;
-  options.state = folder_ / "state";
+  options.state = state_;
+  options.kept_trace = hosted_tee::trace_level::error;  // as for every client
   world_ = hosted_tee::secure_world::open_shared(options);
   open();
 }
@@ -81,12 +53,10 @@ bench_device::bench_device() {
 bench_device::~bench_device() {
   close();
   world_.reset();
-  std::error_code ignored;
-  std::filesystem::remove_all(folder_, ignored);
 }
 
 void bench_device::open() {
-  const std::string name = "embedded:" + (folder_ / "state").string();
+  const std::string name = "embedded:" + state_.string();
   must(TEEC_InitializeContext(name.c_str(), &context_) == TEEC_SUCCESS, "no connection to the TEE");
   must(TEEC_OpenSession(&context_, &session_, &teec_uuid, TEEC_LOGIN_PUBLIC, nullptr, nullptr, nullptr) == TEEC_SUCCESS,
        "no session to the TA");
@@ -134,25 +104,12 @@ bytes bench_device::generate(const bytes& params) {
   return blob;
 }
 
-ta_signer::ta_signer(bench_device& device, const bytes& blob, const bytes& message) : device_(device), response_(4096) {
-  append_block(begin_request_, blob);
-  append_block(begin_request_, rsa_sign_params());
-  append_block(update_request_, message);
-  append_block(update_request_, marshal({}));
-  append_block(finish_request_, {});
-  append_block(finish_request_, marshal({}));
-}
-
-std::uint32_t ta_signer::begin() {
-  return device_.must_invoke(KM_COMMAND_BEGIN, KM_PURPOSE_SIGN, &begin_request_, &response_).b;
-}
-
-const bytes& ta_signer::sign() {
-  const std::uint32_t handle = begin();
-  device_.must_invoke(KM_COMMAND_UPDATE, handle, &update_request_, &response_);
-  device_.must_invoke(KM_COMMAND_FINISH, handle, &finish_request_, &response_);
-  signature_.assign(response_.begin() + 4, response_.begin() + 4 + u32_at(response_, 0));
-  return signature_;
+bytes bench_device::import_key(const bytes& params, const bytes& material) {
+  bytes request, response(16384);
+  append_block(request, params);
+  request.insert(request.end(), material.begin(), material.end());
+  must_invoke(KM_COMMAND_IMPORT_KEY, 0, &request, &response);
+  return {response.begin() + 4, response.begin() + 4 + u32_at(response, 0)};
 }
 
 }  // namespace bench

@@ -5,28 +5,14 @@
 
 #include <cstdint>
 #include <filesystem>
-#include <initializer_list>
 #include <memory>
-#include <utility>
-#include <vector>
+#include <optional>
 
+#include "bench/wire.h"
 #include "tee/runtime/secure_world.h"
 #include "tee_client_api.h"
 
 namespace bench {
-
-using bytes = std::vector<std::uint8_t>;
-
-void append_u32(bytes& body, std::uint32_t value);
-void append_block(bytes& body, const bytes& block);  ///< behind its length
-std::uint32_t u32_at(const bytes& data, std::size_t offset);
-
-/// marshal gives the byte form of parameters that are numbers.
-bytes marshal(std::initializer_list<std::pair<std::uint32_t, std::uint64_t>> params);
-
-/// rsa_sign_key asks for a key that signs with PKCS#1 v1.5 and SHA-256; rsa_sign_params for an operation that does.
-bytes rsa_sign_key(std::uint32_t bits);
-bytes rsa_sign_params();
 
 /// One command's outcome. `a` is the Keymaster error, `b` the command's number, `size` what was written to the
 /// response.
@@ -37,10 +23,24 @@ struct reply {
   std::size_t size = 0;
 };
 
-/// A device on a state folder of its own, which goes with it. What fails throws std::runtime_error.
+/// A folder that goes with its owner.
+class temporary_folder {
+ public:
+  temporary_folder();
+  temporary_folder(const temporary_folder&) = delete;
+  temporary_folder& operator=(const temporary_folder&) = delete;
+  ~temporary_folder();
+  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
+
+ private:
+  std::filesystem::path path_;
+};
+
+/// A device in a state folder: a given one, which stays, or one of its own. What fails throws std::runtime_error.
 class bench_device {
  public:
   bench_device();
+  explicit bench_device(std::filesystem::path state);
   bench_device(const bench_device&) = delete;
   bench_device& operator=(const bench_device&) = delete;
   ~bench_device();
@@ -60,29 +60,20 @@ class bench_device {
   /// generate answers the sealed blob of a fresh key.
   bytes generate(const bytes& params);
 
+  /// import_key answers the sealed blob of `material`, which is in the algorithm's own layout.
+  bytes import_key(const bytes& params, const bytes& material);
+
  private:
   void open();
   void close();
 
-  std::filesystem::path folder_;
+  void start();
+
+  std::optional<temporary_folder> own_folder_;
+  std::filesystem::path state_;
   std::shared_ptr<hosted_tee::secure_world> world_;
   TEEC_Context context_ = {};
   TEEC_Session session_ = {};
-};
-
-/// A signature by the TA in three commands, with the blob handed over each time.
-class ta_signer {
- public:
-  ta_signer(bench_device& device, const bytes& blob, const bytes& message);
-  const bytes& sign();
-
-  /// begin starts an operation without going on, and answers its handle.
-  std::uint32_t begin();
-
- private:
-  bench_device& device_;
-  bytes begin_request_, update_request_, finish_request_;
-  bytes response_, signature_;
 };
 
 }  // namespace bench

@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <array>
-#include <stdexcept>
 
 namespace bench {
 namespace {
@@ -18,10 +17,6 @@ constexpr std::array<const char*, 8> component_names = {
     OSSL_PKEY_PARAM_RSA_N,         OSSL_PKEY_PARAM_RSA_E,           OSSL_PKEY_PARAM_RSA_D,
     OSSL_PKEY_PARAM_RSA_FACTOR1,   OSSL_PKEY_PARAM_RSA_FACTOR2,     OSSL_PKEY_PARAM_RSA_EXPONENT1,
     OSSL_PKEY_PARAM_RSA_EXPONENT2, OSSL_PKEY_PARAM_RSA_COEFFICIENT1};
-
-void must(bool done) {
-  if (!done) throw std::runtime_error("libcrypto refuses");
-}
 
 }  // namespace
 
@@ -35,28 +30,28 @@ libcrypto_signer::libcrypto_signer(bytes ksk, bytes blob, bytes message)
       hmac_(EVP_MAC_fetch(nullptr, "HMAC", nullptr)),
       aes_(EVP_CIPHER_fetch(nullptr, "AES-256-GCM", nullptr)),
       sha256_(EVP_MD_fetch(nullptr, "SHA2-256", nullptr)) {
-  must(hmac_ && aes_ && sha256_);
+  expect(hmac_ && aes_ && sha256_);
 }
 
 void libcrypto_signer::derive_key() {
-  const std::unique_ptr<EVP_MAC_CTX, freed_by<EVP_MAC_CTX_free>> context(EVP_MAC_CTX_new(hmac_.get()));
+  const mac_context_owner context(EVP_MAC_CTX_new(hmac_.get()));
   char digest[] = "SHA2-256";
   const std::array<OSSL_PARAM, 2> params = {OSSL_PARAM_construct_utf8_string(OSSL_MAC_PARAM_DIGEST, digest, 0),
                                             OSSL_PARAM_construct_end()};
   std::size_t length = 0;
-  must(EVP_MAC_init(context.get(), ksk_.data(), ksk_.size(), params.data()) == 1 &&
-       EVP_MAC_update(context.get(), &blob_.at(nonce_offset), nonce_size) == 1 &&
-       EVP_MAC_final(context.get(), blob_key_.data(), &length, blob_key_.size()) == 1);
+  expect(EVP_MAC_init(context.get(), ksk_.data(), ksk_.size(), params.data()) == 1 &&
+         EVP_MAC_update(context.get(), &blob_.at(nonce_offset), nonce_size) == 1 &&
+         EVP_MAC_final(context.get(), blob_key_.data(), &length, blob_key_.size()) == 1);
 }
 
 void libcrypto_signer::open_blob() {
-  const std::unique_ptr<EVP_CIPHER_CTX, freed_by<EVP_CIPHER_CTX_free>> context(EVP_CIPHER_CTX_new());
+  const cipher_context_owner context(EVP_CIPHER_CTX_new());
   int length = 0;
-  must(EVP_DecryptInit_ex2(context.get(), aes_.get(), blob_key_.data(), &blob_.at(iv_offset), nullptr) == 1 &&
-       EVP_DecryptUpdate(context.get(), plaintext_.data(), &length, &blob_.at(header),
-                         static_cast<int>(plaintext_.size())) == 1 &&
-       EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_AEAD_SET_TAG, tag_size, &blob_.at(tag_offset)) == 1 &&
-       EVP_DecryptFinal_ex(context.get(), plaintext_.data() + length, &length) == 1);
+  expect(EVP_DecryptInit_ex2(context.get(), aes_.get(), blob_key_.data(), &blob_.at(iv_offset), nullptr) == 1 &&
+         EVP_DecryptUpdate(context.get(), plaintext_.data(), &length, &blob_.at(header),
+                           static_cast<int>(plaintext_.size())) == 1 &&
+         EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_AEAD_SET_TAG, tag_size, &blob_.at(tag_offset)) == 1 &&
+         EVP_DecryptFinal_ex(context.get(), plaintext_.data() + length, &length) == 1);
 }
 
 EVP_PKEY* libcrypto_signer::make_key() {
@@ -74,34 +69,33 @@ EVP_PKEY* libcrypto_signer::make_key() {
     at += length;
   }
   params.back() = OSSL_PARAM_construct_end();
-  const std::unique_ptr<EVP_PKEY_CTX, freed_by<EVP_PKEY_CTX_free>> context(
-      EVP_PKEY_CTX_new_from_name(nullptr, "RSA", nullptr));
+  const key_context_owner context(EVP_PKEY_CTX_new_from_name(nullptr, "RSA", nullptr));
   EVP_PKEY* key = nullptr;
-  must(EVP_PKEY_fromdata_init(context.get()) == 1 &&
-       EVP_PKEY_fromdata(context.get(), &key, EVP_PKEY_KEYPAIR, params.data()) == 1);
+  expect(EVP_PKEY_fromdata_init(context.get()) == 1 &&
+         EVP_PKEY_fromdata(context.get(), &key, EVP_PKEY_KEYPAIR, params.data()) == 1);
   return key;
 }
 
 void libcrypto_signer::sign_message(EVP_PKEY* key) {
-  const std::unique_ptr<EVP_MD_CTX, freed_by<EVP_MD_CTX_free>> context(EVP_MD_CTX_new());
+  const digest_context_owner context(EVP_MD_CTX_new());
   std::array<std::uint8_t, 32> digest;
-  must(EVP_DigestInit_ex2(context.get(), sha256_.get(), nullptr) == 1 &&
-       EVP_DigestUpdate(context.get(), message_.data(), message_.size()) == 1 &&
-       EVP_DigestFinal_ex(context.get(), digest.data(), nullptr) == 1);
-  const std::unique_ptr<EVP_PKEY_CTX, freed_by<EVP_PKEY_CTX_free>> signing(
-      EVP_PKEY_CTX_new_from_pkey(nullptr, key, nullptr));
+  expect(EVP_DigestInit_ex2(context.get(), sha256_.get(), nullptr) == 1 &&
+         EVP_DigestUpdate(context.get(), message_.data(), message_.size()) == 1 &&
+         EVP_DigestFinal_ex(context.get(), digest.data(), nullptr) == 1);
+  const key_context_owner signing(EVP_PKEY_CTX_new_from_pkey(nullptr, key, nullptr));
   signature_.resize(1024);
   std::size_t length = signature_.size();
-  must(EVP_PKEY_sign_init(signing.get()) == 1 && EVP_PKEY_CTX_set_rsa_padding(signing.get(), RSA_PKCS1_PADDING) == 1 &&
-       EVP_PKEY_CTX_set_signature_md(signing.get(), sha256_.get()) == 1 &&
-       EVP_PKEY_sign(signing.get(), signature_.data(), &length, digest.data(), digest.size()) == 1);
+  expect(EVP_PKEY_sign_init(signing.get()) == 1 &&
+         EVP_PKEY_CTX_set_rsa_padding(signing.get(), RSA_PKCS1_PADDING) == 1 &&
+         EVP_PKEY_CTX_set_signature_md(signing.get(), sha256_.get()) == 1 &&
+         EVP_PKEY_sign(signing.get(), signature_.data(), &length, digest.data(), digest.size()) == 1);
   signature_.resize(length);
 }
 
 const bytes& libcrypto_signer::sign() {
   derive_key();
   open_blob();
-  const std::unique_ptr<EVP_PKEY, freed_by<EVP_PKEY_free>> key(make_key());
+  const key_owner key(make_key());
   sign_message(key.get());
   OPENSSL_cleanse(blob_key_.data(), blob_key_.size());
   OPENSSL_cleanse(plaintext_.data(), plaintext_.size());

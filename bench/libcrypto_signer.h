@@ -2,11 +2,8 @@
 #ifndef BENCH_LIBCRYPTO_SIGNER_H_
 #define BENCH_LIBCRYPTO_SIGNER_H_
 
-#include <openssl/evp.h>
-
-#include <memory>
-
-#include "bench/bench_device.h"
+#include "bench/libcrypto_owner.h"
+#include "bench/wire.h"
 
 namespace bench {
 
@@ -18,14 +15,6 @@ class libcrypto_signer {
   const bytes& sign();
 
  private:
-  template <auto Free>
-  struct freed_by {
-    template <class T>
-    void operator()(T* item) const {
-      Free(item);
-    }
-  };
-
   void derive_key();
   void open_blob();
   [[nodiscard]] EVP_PKEY* make_key();
@@ -33,9 +22,9 @@ class libcrypto_signer {
 
   bytes ksk_, blob_, message_;
   bytes blob_key_, plaintext_, numbers_, signature_;
-  std::unique_ptr<EVP_MAC, freed_by<EVP_MAC_free>> hmac_;
-  std::unique_ptr<EVP_CIPHER, freed_by<EVP_CIPHER_free>> aes_;
-  std::unique_ptr<EVP_MD, freed_by<EVP_MD_free>> sha256_;
+  mac_owner hmac_;
+  cipher_owner aes_;
+  digest_owner sha256_;
 };
 
 }  // namespace bench

@@ -2,6 +2,8 @@
 // does: the TA does not panic, touches nothing but its own memory and the buffers it is given, and once the operations
 // are aborted it holds what it held before.
 #include <array>
+#include <initializer_list>
+#include <utility>
 
 #include "fuzz/fuzz_device.h"
 #include "fuzz/fuzz_steps.h"
@@ -21,25 +23,54 @@ struct fixture {
   std::vector<bytes> blobs;
 };
 
-param_writer signing_key() {
+param_writer key_of(std::uint32_t algorithm, std::uint32_t bits, std::initializer_list<std::uint32_t> purposes) {
   param_writer params;
-  params.add(KM_TAG_ALGORITHM, KM_ALGORITHM_RSA)
-      .add(KM_TAG_KEY_SIZE, 512)
-      .add(KM_TAG_RSA_PUBLIC_EXPONENT, 65537)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_SIGN)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_VERIFY);
-  for (std::uint32_t padding : {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN}) {
-    params.add(KM_TAG_PADDING, padding);
-  }
+  params.add(KM_TAG_ALGORITHM, algorithm).add(KM_TAG_KEY_SIZE, bits);
+  for (const std::uint32_t purpose : purposes) params.add(KM_TAG_PURPOSE, purpose);
+  return params;
+}
+
+param_writer& add_digests(param_writer& params) {
   for (std::uint32_t digest = KM_DIGEST_NONE; digest <= KM_DIGEST_SHA_2_512; ++digest) {
     params.add(KM_TAG_DIGEST, digest);
   }
   return params;
 }
 
+param_writer signing_key() {
+  param_writer params = key_of(KM_ALGORITHM_RSA, 512, {KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY});
+  params.add(KM_TAG_RSA_PUBLIC_EXPONENT, 65537);
+  for (std::uint32_t padding : {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN}) {
+    params.add(KM_TAG_PADDING, padding);
+  }
+  return add_digests(params);
+}
+
+/// Keys of the other kinds: what begins with them is allowed to do whatever they can do at all.
+std::vector<bytes> other_keys() {
+  param_writer rsa = key_of(KM_ALGORITHM_RSA, 768, {KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT});
+  rsa.add(KM_TAG_RSA_PUBLIC_EXPONENT, 65537);
+  for (std::uint32_t padding : {KM_PAD_NONE, KM_PAD_RSA_OAEP, KM_PAD_RSA_PKCS1_1_5_ENCRYPT}) {
+    rsa.add(KM_TAG_PADDING, padding);
+  }
+  param_writer aes = key_of(KM_ALGORITHM_AES, 128, {KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT});
+  for (std::uint32_t mode : {KM_MODE_ECB, KM_MODE_CBC, KM_MODE_CTR, KM_MODE_GCM}) aes.add(KM_TAG_BLOCK_MODE, mode);
+  aes.add(KM_TAG_PADDING, KM_PAD_NONE).add(KM_TAG_PADDING, KM_PAD_PKCS7);
+  aes.add(KM_TAG_CALLER_NONCE, 1).add(KM_TAG_MIN_MAC_LENGTH, 96);
+  param_writer ec = key_of(KM_ALGORITHM_EC, 256, {KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY});
+  add_digests(ec);
+  param_writer hmac = key_of(KM_ALGORITHM_HMAC, 256, {KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY});
+  hmac.add(KM_TAG_DIGEST, KM_DIGEST_SHA_2_256).add(KM_TAG_MIN_MAC_LENGTH, 64);
+  std::vector<bytes> requests;
+  for (param_writer* const key : {&rsa, &aes, &ec, &hmac}) {
+    requests.push_back(key->add(KM_TAG_NO_AUTH_REQUIRED, 1).marshal());
+  }
+  return requests;
+}
+
 /// Keys that between them reach every rule of use.
 std::vector<bytes> make_blobs(fuzz_device& device) {
-  const std::array<bytes, 6> requests = {
+  std::vector<bytes> requests = {
       signing_key().add(KM_TAG_NO_AUTH_REQUIRED, 1).marshal(),
       signing_key()
           .add(KM_TAG_NO_AUTH_REQUIRED, 1)
@@ -61,6 +92,7 @@ std::vector<bytes> make_blobs(fuzz_device& device) {
           .add(KM_TAG_USAGE_EXPIRE_DATETIME, 1'800'000'000'000)
           .marshal(),
   };
+  for (bytes& other : other_keys()) requests.push_back(std::move(other));
   std::vector<bytes> blobs;
   device.open();
   for (const bytes& request : requests) {
@@ -162,20 +194,23 @@ void command_sequence::generate() {
 }
 
 void command_sequence::import_key() {
+  constexpr std::array<std::uint32_t, 4> algorithms = {KM_ALGORITHM_RSA, KM_ALGORITHM_EC, KM_ALGORITHM_AES,
+                                                       KM_ALGORITHM_HMAC};
+  const std::uint32_t algorithm = in_.pick(algorithms);
   bytes params = param_writer{}
-                     .add(KM_TAG_ALGORITHM, KM_ALGORITHM_RSA)
+                     .add(KM_TAG_ALGORITHM, algorithm)
                      .add(KM_TAG_PURPOSE, KM_PURPOSE_SIGN)
                      .add(KM_TAG_PURPOSE, KM_PURPOSE_VERIFY)
                      .add(KM_TAG_PADDING, KM_PAD_RSA_PKCS1_1_5_SIGN)
                      .add(KM_TAG_PADDING, KM_PAD_NONE)
                      .add(KM_TAG_DIGEST, KM_DIGEST_SHA_2_256)
-                     .add(KM_TAG_DIGEST, KM_DIGEST_NONE)
+                     .add(KM_TAG_MIN_MAC_LENGTH, 96)
                      .add(KM_TAG_NO_AUTH_REQUIRED, 1)
                      .marshal();
   if (in_.below(4) == 0) params = read_params(in_, 0);
   bytes request;
   append_block(request, params);
-  const bytes material = read_material(in_);
+  const bytes material = read_material(in_, algorithm);
   request.insert(request.end(), material.begin(), material.end());
   damage(in_, request);
   const reply made = send({KM_COMMAND_IMPORT_KEY, 0, 0, request, read_capacity(), {}});
@@ -199,7 +234,7 @@ void command_sequence::use_key(std::uint32_t id, bool with_response) {
 void command_sequence::begin() {
   bytes request;
   const std::uint32_t purpose =
-      in_.below(8) == 7 ? in_.u32() : KM_PURPOSE_SIGN + static_cast<std::uint32_t>(in_.below(2));
+      in_.below(8) == 7 ? in_.u32() : (KM_PURPOSE_SIGN + static_cast<std::uint32_t>(in_.below(4))) % 4;
   append_block(request, read_blob());
   append_block(request, read_params(in_, handles_.empty() ? 0 : handles_.back()));
   damage(in_, request);

@@ -1,6 +1,6 @@
-// Writes the seeds that the fuzzers start from: a few whole lives of keys and operations, and a few parameter sets.
+// Writes the seeds that the fuzzers start from: whole lives of keys and operations, parameter sets, signatures, keys.
 //
-// usage: make_corpus FOLDER      writes FOLDER/command_fuzzer/* and FOLDER/marshal_fuzzer/*
+// usage: make_corpus FOLDER      writes FOLDER/command_fuzzer/* and so on for each fuzzer
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -48,6 +48,44 @@ void finish(bytes& all, int size) {
   join(all, {0, 0, 0});
 }
 
+/// With block mode, padding, MAC length and nonce, by their places in the tables.
+void begin_cipher(bytes& all, int blob, int purpose, int mode, int padding, int mac_length, int nonce) {
+  join(all, {number(step::begin), 0, purpose, blob, with_cipher, mode, padding, mac_length, nonce, 0, 0});
+}
+
+/// One operation of each kind of key beside RSA signatures. The purposes count from signing on.
+bytes other_operations() {
+  constexpr int sign = 0, verify = 1, encrypt = 2, decrypt = 3;
+  constexpr int rsa = 6, aes = 7, ec = 8, hmac = 9;
+  bytes all;
+  for (const int purpose : {encrypt, decrypt}) {
+    for (int padding = 0; padding < 5; ++padding) {
+      begin(all, rsa, purpose, padding == 3 ? 4 : 0, padding);
+      update(all, 12);
+      finish(all, 0);
+    }
+    for (int mode = 0; mode < 4; ++mode) {
+      for (int padding = 0; padding < 2; ++padding) {
+        begin_cipher(all, aes, purpose, mode, padding, 0, mode == 3 ? 1 : 2);
+        update(all, 40);
+        update(all, 24);
+        finish(all, 0);
+      }
+    }
+  }
+  for (const int purpose : {sign, verify}) {
+    for (int digest = 0; digest < 7; ++digest) {
+      begin(all, ec, purpose, digest, 0);
+      update(all, 40);
+      finish(all, purpose == verify ? 70 : 0);
+    }
+    begin_cipher(all, hmac, purpose, 0, 0, 1, 0);
+    update(all, 40);
+    finish(all, purpose == verify ? 16 : 0);
+  }
+  return all;
+}
+
 /// One operation of every scheme: two pieces of message, then its end.
 bytes whole_operations(int verify) {
   bytes all;
@@ -63,9 +101,9 @@ bytes whole_operations(int verify) {
 }
 
 seeds command_seeds() {
-  seeds all = {{"sign", whole_operations(0)}, {"verify", whole_operations(1)}};
+  seeds all = {{"sign", whole_operations(0)}, {"verify", whole_operations(1)}, {"others", other_operations()}};
   bytes keys;
-  join(keys, {number(step::generate), 1, 0, 0, number(step::import_key), 1, 0, 0, 0, 0});
+  join(keys, {number(step::generate), 1, 0, 0, number(step::import_key), 0, 1, 0, 0, 0, 0});
   for (const step use : {step::characteristics_size, step::characteristics, step::export_key, step::delete_key}) {
     for (int blob = 0; blob < 6; ++blob) {
       join(keys, {number(use), blob});
@@ -139,6 +177,45 @@ seeds marshal_seeds() {
   return all;
 }
 
+/// A field's place in the table of sizes, then a signature.
+seeds signature_seeds() {
+  bytes small = {2, 0x30, 6, 2, 1, 1, 2, 1, 1};
+  bytes full = {2, 0x30, 0x46};
+  for (int i = 0; i < 2; ++i) {
+    join(full, {2, 0x21, 0});
+    full.insert(full.end(), 32, 0x91);
+  }
+  bytes wide = {4, 0x30, 0x81, 0x88};
+  for (int i = 0; i < 2; ++i) {
+    join(wide, {2, 0x42, 1});
+    wide.insert(wide.end(), 65, 0x91);
+  }
+  return {{"small", small}, {"full", full}, {"wide", wide}, {"zero", {2, 0x30, 4, 2, 0, 2, 0}}};
+}
+
+/// The module's place, a digest, a capacity, then key data.
+seeds key_data_seeds() {
+  seeds all;
+  const auto add = [&](const std::string& name, int module, std::uint32_t algorithm) {
+    bytes seed = {static_cast<std::uint8_t>(module), 4, 200};
+    const bytes zeros(16);
+    input_reader unchanged(zeros);
+    const bytes material = read_material(unchanged, algorithm);
+    if (algorithm == KM_ALGORITHM_RSA) append_u32(seed, 512);
+    if (algorithm == KM_ALGORITHM_AES) append_u32(seed, 128);
+    if (algorithm == KM_ALGORITHM_HMAC) join(seed, {128, 0, 0, 0, 4, 0, 0, 0xA0});
+    seed.insert(seed.end(), material.begin(), material.end());
+    all.emplace_back(name, seed);
+    all.emplace_back(name + "_material", bytes{static_cast<std::uint8_t>(module), 4, 200});
+    all.back().second.insert(all.back().second.end(), material.begin(), material.end());
+  };
+  add("rsa", 0, KM_ALGORITHM_RSA);
+  add("ec", 1, KM_ALGORITHM_EC);
+  add("aes", 2, KM_ALGORITHM_AES);
+  add("hmac", 3, KM_ALGORITHM_HMAC);
+  return all;
+}
+
 bool write(const std::filesystem::path& folder, const seeds& all) {
   std::filesystem::create_directories(folder);
   for (const auto& [name, content] : all) {
@@ -159,6 +236,8 @@ int main(int argc, char** argv) {
   }
   const std::filesystem::path folder = argv[1];
   const bool written = fuzzing::write(folder / "command_fuzzer", fuzzing::command_seeds()) &&
-                       fuzzing::write(folder / "marshal_fuzzer", fuzzing::marshal_seeds());
+                       fuzzing::write(folder / "marshal_fuzzer", fuzzing::marshal_seeds()) &&
+                       fuzzing::write(folder / "signature_fuzzer", fuzzing::signature_seeds()) &&
+                       fuzzing::write(folder / "key_data_fuzzer", fuzzing::key_data_seeds());
   return written ? 0 : 1;
 }

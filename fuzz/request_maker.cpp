@@ -99,9 +99,21 @@ void read_param(input_reader& in, std::uint32_t handle, param_writer& params) {
 
 /// The parameters that the paths into RSA code ask for, so that an input need not find them one by one.
 void add_scheme(input_reader& in, param_writer& params) {
-  constexpr std::array<std::uint64_t, 4> paddings = {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN,
-                                                     KM_PAD_RSA_OAEP};
+  constexpr std::array<std::uint64_t, 5> paddings = {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN,
+                                                     KM_PAD_RSA_OAEP, KM_PAD_RSA_PKCS1_1_5_ENCRYPT};
   params.add(KM_TAG_DIGEST, in.below(8)).add(KM_TAG_PADDING, in.pick(paddings));
+}
+
+/// The same for ciphers and MACs. A nonce is given as often as not.
+void add_cipher(input_reader& in, param_writer& params) {
+  constexpr std::array<std::uint64_t, 4> block_modes = {KM_MODE_ECB, KM_MODE_CBC, KM_MODE_CTR, KM_MODE_GCM};
+  constexpr std::array<std::uint64_t, 2> paddings = {KM_PAD_NONE, KM_PAD_PKCS7};
+  constexpr std::array<std::uint64_t, 5> mac_lengths = {96, 128, 256, 0, 100};
+  constexpr std::array<std::size_t, 4> nonce_sizes = {0, 12, 16, 7};
+  params.add(KM_TAG_BLOCK_MODE, in.pick(block_modes))
+      .add(KM_TAG_PADDING, in.pick(paddings))
+      .add(KM_TAG_MAC_LENGTH, in.pick(mac_lengths));
+  if (const std::size_t size = in.pick(nonce_sizes); size != 0) params.add_blob(KM_TAG_NONCE, bytes(size, 9));
 }
 
 struct rsa_numbers {
@@ -125,6 +137,33 @@ rsa_numbers make_numbers() {
   }
   EVP_PKEY_free(key);
   return numbers;
+}
+
+bytes rsa_material(input_reader& in) {
+  static const rsa_numbers own = make_numbers();
+  bytes material;
+  const std::uint8_t replaced = in.u8();
+  for (std::size_t i = 0; i < own.parts.size(); ++i) {
+    append_block(material, (replaced >> i & 1U) != 0 ? in.take(in.below(80)) : own.parts.at(i));
+  }
+  return material;
+}
+
+/// X, Y and D of the P-256 key whose private value is 1: the curve's base point (SP 800-186, section 3.2.1.3).
+bytes ec_material(input_reader& in) {
+  static const std::array<bytes, 3> own = {
+      bytes{0x6B, 0x17, 0xD1, 0xF2, 0xE1, 0x2C, 0x42, 0x47, 0xF8, 0xBC, 0xE6, 0xE5, 0x63, 0xA4, 0x40, 0xF2,
+            0x77, 0x03, 0x7D, 0x81, 0x2D, 0xEB, 0x33, 0xA0, 0xF4, 0xA1, 0x39, 0x45, 0xD8, 0x98, 0xC2, 0x96},
+      bytes{0x4F, 0xE3, 0x42, 0xE2, 0xFE, 0x1A, 0x7F, 0x9B, 0x8E, 0xE7, 0xEB, 0x4A, 0x7C, 0x0F, 0x9E, 0x16,
+            0x2B, 0xCE, 0x33, 0x57, 0x6B, 0x31, 0x5E, 0xCE, 0xCB, 0xB6, 0x40, 0x68, 0x37, 0xBF, 0x51, 0xF5},
+      bytes{1}};
+  bytes material;
+  const std::uint8_t replaced = in.u8();
+  append_u32(material, (replaced & 8U) != 0 ? static_cast<std::uint32_t>(in.pick(values)) : 256);
+  for (std::size_t i = 0; i < own.size(); ++i) {
+    append_block(material, (replaced >> i & 1U) != 0 ? in.take(in.below(80)) : own.at(i));
+  }
+  return material;
 }
 
 }  // namespace
@@ -179,6 +218,7 @@ bytes read_params(input_reader& in, std::uint32_t handle) {
   param_writer params;
   const std::size_t shape = in.u8();
   if ((shape & with_scheme) != 0) add_scheme(in, params);
+  if ((shape & with_cipher) != 0) add_cipher(in, params);
   if ((shape & with_token) != 0) params.add_blob(KM_TAG_AUTH_TOKEN, read_auth_token(in, handle));
   if ((shape & with_application) != 0) {
     params.add_blob(KM_TAG_APPLICATION_ID, {1, 2, 3}).add_blob(KM_TAG_APPLICATION_DATA, {4, 5});
@@ -187,14 +227,11 @@ bytes read_params(input_reader& in, std::uint32_t handle) {
   return params.marshal();
 }
 
-bytes read_material(input_reader& in) {
-  static const rsa_numbers own = make_numbers();
-  bytes material;
-  const std::uint8_t replaced = in.u8();
-  for (std::size_t i = 0; i < own.parts.size(); ++i) {
-    append_block(material, (replaced >> i & 1U) != 0 ? in.take(in.below(80)) : own.parts.at(i));
-  }
-  return material;
+bytes read_material(input_reader& in, std::uint32_t algorithm) {
+  if (algorithm == KM_ALGORITHM_RSA) return rsa_material(in);
+  if (algorithm == KM_ALGORITHM_EC) return ec_material(in);
+  constexpr std::array<std::size_t, 6> sizes = {16, 24, 32, 64, 0, 15};
+  return bytes(in.pick(sizes), in.u8());
 }
 
 void damage(input_reader& in, bytes& body) {

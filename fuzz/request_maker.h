@@ -26,13 +26,14 @@ class param_writer {
 
 /// What the first byte of a parameter set asks for beside single parameters, whose count is in its lowest bits: digest
 /// and padding of an operation, an auth token, the id and data of the application that owns the second key.
-inline constexpr int with_scheme = 0x80, with_token = 0x40, with_application = 0x20;
+/// With `with_cipher`: block mode, padding, MAC length and nonce of a cipher or a MAC.
+inline constexpr int with_scheme = 0x80, with_token = 0x40, with_application = 0x20, with_cipher = 0x10;
 
 /// read_params makes a parameter set of known tags. `handle` is what an auth token may be bound to.
 bytes read_params(input_reader& in, std::uint32_t handle);
 
-/// read_material makes RSA import material: a key's own components, some of them replaced.
-bytes read_material(input_reader& in);
+/// read_material makes import material for an algorithm: a key's own components, some of them replaced, or raw bytes.
+bytes read_material(input_reader& in, std::uint32_t algorithm);
 
 /// damage flips, cuts or extends `body`, or leaves it alone.
 void damage(input_reader& in, bytes& body);

@@ -1,20 +1,20 @@
 #include "tee/client/connection.h"
 
-#include <pwd.h>
-#include <unistd.h>
-
 #include <array>
 #include <cstdlib>
 #include <string_view>
 #include <utility>
+
+#include "tee/client/default_folder.h"
 
 namespace hosted_tee {
 namespace {
 
 constexpr std::string_view embedded = "embedded:";
 
-constexpr std::array<std::pair<world_fault, TEEC_Result>, 5> fault_results{{
+constexpr std::array<std::pair<world_fault, TEEC_Result>, 6> fault_results{{
     {world_fault::busy, TEEC_ERROR_BUSY},
+    {world_fault::foreign, TEEC_ERROR_BAD_PARAMETERS},
     {world_fault::newer, TEEC_ERROR_BAD_STATE},
     {world_fault::malformed, TEEC_ERROR_BAD_FORMAT},
     {world_fault::corrupt, TEEC_ERROR_SECURITY},
@@ -27,16 +27,13 @@ const char* environment(const char* variable) {
   return value == nullptr || *value == '\0' ? nullptr : value;
 }
 
-std::filesystem::path home_folder() {
-  if (const char* home = environment("HOME")) return home;
-  const passwd* user = ::getpwuid(::geteuid());
-  if (user == nullptr || user->pw_dir == nullptr) throw client_failure(TEEC_ERROR_GENERIC);
-  return user->pw_dir;
-}
-
 std::filesystem::path state_folder_of(const char* name) {
   if (name == nullptr) name = environment("KEYMASTER_TEE");
-  if (name == nullptr) return default_state_folder();
+  if (name == nullptr) {
+    const auto folder = default_state_folder();
+    if (!folder) throw client_failure(TEEC_ERROR_GENERIC);
+    return *folder;
+  }
   const std::string_view text = name;
   if (!text.starts_with(embedded) || text.size() == embedded.size()) throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
   return text.substr(embedded.size());
@@ -44,18 +41,10 @@ std::filesystem::path state_folder_of(const char* name) {
 
 }  // namespace
 
-std::filesystem::path default_state_folder() {
-  if (const char* folder = environment("KEYMASTER_STATE")) return folder;
-  // The XDG Base Directory rules have a relative path ignored.
-  const char* const states = environment("XDG_STATE_HOME");
-  if (states != nullptr && std::filesystem::path(states).is_absolute())
-    return std::filesystem::path(states) / "keymaster";
-  return home_folder() / ".local" / "state" / "keymaster";
-}
-
 std::shared_ptr<secure_world> connect(const char* name) {
   world_options options;
   options.state = state_folder_of(name);
+  options.kept_trace = trace_level::error;
   return secure_world::open_shared(options);
 }
 

@@ -2,7 +2,6 @@
 #ifndef TEE_CLIENT_CONNECTION_H_
 #define TEE_CLIENT_CONNECTION_H_
 
-#include <filesystem>
 #include <memory>
 
 #include "tee/runtime/secure_world.h"
@@ -32,12 +31,8 @@ class client_failure : public std::exception {
   TEEC_Result code_;
 };
 
-/// default_state_folder is $KEYMASTER_STATE, else $XDG_STATE_HOME/keymaster, else ~/.local/state/keymaster. Throws
-/// client_failure with TEEC_ERROR_GENERIC when none of these and no home folder is known.
-[[nodiscard]] std::filesystem::path default_state_folder();
-
 /// connect finds or starts the device that `name` stands for, as TEEC_InitializeContext documents it. Throws
-/// client_failure or world_error.
+/// client_failure, with TEEC_ERROR_GENERIC when there is no default folder, or world_error.
 [[nodiscard]] std::shared_ptr<secure_world> connect(const char* name);
 
 /// result_of is the result that a device which can't be used has in the Client API.

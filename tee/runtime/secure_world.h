@@ -28,6 +28,7 @@ namespace hosted_tee {
 /// Why a state folder cannot be used.
 enum class world_fault {
   busy,       ///< another process holds the folder
+  foreign,    ///< it holds something else
   newer,      ///< a newer version of the hosted TEE wrote it
   malformed,  ///< one of its text files can't be parsed: a mistake in `settings`, or another one altered
   corrupt,    ///< its content does not authenticate, or belongs to another device
@@ -51,6 +52,10 @@ struct world_options {
   std::optional<TEE_UUID> device_id;  ///< default: its settings, else drawn once and kept in the state folder
   std::optional<std::array<std::uint8_t, 32>> boot_seed;  ///< default: drawn at every start
   std::optional<std::uint32_t> heap_limit;                ///< of every TA, instead of its gpd.ta.dataSize
+
+  /// Lines up to this level stay in the trace. The Client API keeps errors alone: formatting lines for each command
+  /// that nobody reads costs as much as a small command itself.
+  trace_level kept_trace = trace_level::debug;
 
   /// As fault_plan::at_storage_step, from the very first step on; empty: none.
   std::function<void(std::string_view step)> at_storage_step;

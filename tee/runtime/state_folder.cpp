@@ -4,6 +4,7 @@
 #include <openssl/rand.h>
 #include <sys/file.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <charconv>
 #include <system_error>
@@ -29,6 +30,25 @@ using preparation = std::function<void(const device_record&)>;
   throw world_error(world_fault::malformed, file.string() + ": " + why);
 }
 
+bool belongs_before_the_version(const std::filesystem::path& name) {
+  // A person may write settings first, and the others are what a crash of the very first start leaves.
+  return name == "lock" || name == "settings" || name == "version.tee-new";
+}
+
+// What a person keeps in a folder must not be mixed with a device's state: leftovers are deleted by their names. Looked
+// at without the lock, which would be a file there already.
+void refuse_foreign(const std::filesystem::path& folder) {
+  const std::filesystem::path version = folder / "version";
+  if (std::filesystem::exists(version)) return;
+  const std::filesystem::directory_iterator entries(folder);
+  const bool is_foreign = std::any_of(begin(entries), end(entries), [](const auto& entry) {
+    return !belongs_before_the_version(entry.path().filename());
+  });
+  if (!is_foreign || std::filesystem::exists(version)) return;  // another process may just make it
+  if (std::filesystem::exists(folder / "device")) corrupt(version, "it is missing beside a device");
+  throw world_error(world_fault::foreign, folder.string() + " is neither empty nor a device's state");
+}
+
 file_descriptor take_lock(const std::filesystem::path& folder) {
   const std::filesystem::path file = folder / "lock";
   file_descriptor lock(::open(file.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
@@ -52,7 +72,6 @@ void check_version(const std::filesystem::path& folder, const step_observer& ste
   const std::filesystem::path file = folder / "version";
   const std::optional<std::string> content = read_file(file);
   if (!content) {
-    if (std::filesystem::exists(folder / "device")) corrupt(file, "it is missing beside a device");
     write_durably(file, std::to_string(layout_version) + "\n", step);
     return;
   }
@@ -146,6 +165,7 @@ state_folder::state_folder(const std::filesystem::path& path, const step_observe
     : path_(path) {
   try {
     make_folder(path_);
+    refuse_foreign(path_);
     lock_ = take_lock(path_);
     check_version(path_, step);
     remove_leftovers(path_);

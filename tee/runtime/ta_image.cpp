@@ -1,7 +1,9 @@
 #include "tee/runtime/ta_image.h"
 
 #include <dlfcn.h>
+#include <fcntl.h>
 #include <sys/mman.h>
+#include <sys/sendfile.h>
 
 #include <cerrno>
 #include <cstdlib>
@@ -10,7 +12,6 @@
 #include <system_error>
 
 #include "tee/runtime/device_information.h"
-#include "tee/runtime/durable_file.h"
 #include "tee/runtime/uuid.h"
 
 namespace hosted_tee {
@@ -46,12 +47,16 @@ void enter_global_scope() {
   (void)entered;  // what is missing shows when the image is bound
 }
 
+// The kernel copies: an image may carry debugging information many times its own size, which nobody looks at here.
 file_descriptor copy_to_memory(const std::filesystem::path& file) {
-  const std::optional<std::string> content = read_file(file);
-  if (!content) throw std::runtime_error("the file is gone");
+  constexpr std::size_t most_at_once = std::size_t{1} << 30;
+  const file_descriptor source(::open(file.c_str(), O_RDONLY | O_CLOEXEC));
   file_descriptor memory(memfd_create(file.filename().c_str(), MFD_CLOEXEC));
-  if (!memory.is_open()) throw std::system_error(errno, std::generic_category(), "memfd_create");
-  write_all(memory.get(), *content, "the copy of the image");
+  ssize_t copied = source.is_open() && memory.is_open() ? 1 : -1;
+  while (copied > 0 || (copied < 0 && errno == EINTR)) {
+    copied = ::sendfile(memory.get(), source.get(), nullptr, most_at_once);
+  }
+  if (copied < 0) throw std::system_error(errno, std::generic_category(), "copying the image");
   return memory;
 }
 

@@ -75,12 +75,14 @@ void trace_log::keep(trace_line&& line) {
 }
 
 void trace_log::add(trace_line line) {
+  if (!is_wanted(line.level)) return;
   (void)next_line();
   keep(std::move(line));
 }
 
 void trace_log::add_formatted(std::string_view prefix, trace_level level, const char* function, int line,
                               const char* format, std::va_list arguments) {
+  if (!is_wanted(level)) return;
   trace_line entry = next_line();
   entry.prefix.assign(prefix);
   entry.level = level;

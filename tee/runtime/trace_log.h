@@ -25,8 +25,9 @@ struct trace_line {
   [[nodiscard]] std::string printable() const;
 };
 
-/// Holds the latest 4096 lines, whatever their level. Nothing is printed by default, or to standard error up to the
-/// level that the environment variable KEYMASTER_TRACE names (error, info, debug).
+/// Holds the latest 4096 lines of the levels it keeps: all of them, unless keep_up_to says otherwise. Nothing is
+/// printed by default, or to standard error up to the level that the environment variable KEYMASTER_TRACE names (error,
+/// info, debug).
 class trace_log {
  public:
   static constexpr std::size_t capacity = 4096;
@@ -37,6 +38,10 @@ class trace_log {
   /// add_formatted is add for what a TA hands over: `format` and `arguments` as vprintf takes them.
   void add_formatted(std::string_view prefix, trace_level level, const char* function, int line, const char* format,
                      std::va_list arguments);
+
+  /// keep_up_to drops, from now on, lines that are less urgent than `level` unless they are printed. A line that is
+  /// dropped is not formatted either, which is most of what it would cost.
+  void keep_up_to(trace_level level) { kept_level_ = level; }
   void clear() { lines_.clear(); }
   [[nodiscard]] const std::deque<trace_line>& lines() const { return lines_; }
 
@@ -50,10 +55,14 @@ class trace_log {
  private:
   [[nodiscard]] trace_line next_line();
   void keep(trace_line&& line);
+  [[nodiscard]] bool is_wanted(trace_level level) const {
+    return level <= kept_level_ || (sink_ && level <= sink_level_);
+  }
 
   std::deque<trace_line> lines_;
   std::function<void(const trace_line&)> sink_;
   trace_level sink_level_ = trace_level::error;
+  trace_level kept_level_ = trace_level::debug;
 };
 
 }  // namespace hosted_tee

@@ -55,6 +55,7 @@ world::world(const world_options& options)
               }),
       heap_limit_(options.heap_limit) {
   const device_settings& settings = folder_.settings();
+  device_.trace.keep_up_to(options.kept_trace);
   device_.faults.at_storage_step(options.at_storage_step);
   device_.id = options.device_id.value_or(settings.device_id.value_or(folder_.device().id));
   if (options.boot_seed) {

@@ -8,6 +8,7 @@
 #include <fstream>
 
 #include "tee/client/connection.h"
+#include "tee/client/default_folder.h"
 #include "tee/runtime/uuid.h"
 #include "tee_client_api.h"
 #include "tests/tee/world_fixture.h"
@@ -343,6 +344,9 @@ TEST_F(ContextTest, EachFaultOfAFolderHasItsResult) {
   EXPECT_EQ(initialize(name.c_str()), TEEC_ERROR_BAD_FORMAT);
   fs::remove(folder.path() / "state" / "version");
   EXPECT_EQ(initialize(name.c_str()), TEEC_ERROR_SECURITY);
+  fs::create_directory(path("letters"));
+  std::ofstream(folder.path() / "letters" / "to Mary") << "Dear Mary";
+  EXPECT_EQ(initialize(("embedded:" + path("letters")).c_str()), TEEC_ERROR_BAD_PARAMETERS);
   std::ofstream(path("file")) << "in the way";
   EXPECT_EQ(initialize(("embedded:" + path("file")).c_str()), TEEC_ERROR_GENERIC);
 }

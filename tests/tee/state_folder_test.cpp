@@ -138,6 +138,30 @@ TEST_F(StateFolderTest, WithDamagedFilesIsRefused) {
   EXPECT_EQ(fault().first, world_fault::corrupt);
 }
 
+TEST_F(StateFolderTest, OfSomethingElseIsLeftAsItIs) {
+  fs::create_directories(options.state);
+  for (const char* name : {"letter", "other.tee-new", "private.db", ".hidden"}) {
+    write(name, "precious");
+    const auto [why, message] = fault();
+    EXPECT_EQ(why, world_fault::foreign) << name;
+    EXPECT_EQ(message, options.state.string() + " is neither empty nor a device's state");
+    EXPECT_EQ(read(name), "precious");
+    EXPECT_EQ(std::distance(fs::directory_iterator(options.state), fs::directory_iterator()), 1) << name;
+    fs::remove(options.state / name);
+  }
+}
+
+TEST_F(StateFolderTest, MayHoldSettingsAndWhatACrashLeftBeforeItsFirstStart) {
+  fs::create_directories(options.state);
+  write("settings", "rpmb = off\n");
+  write("lock", "");
+  write("version.tee-new", "1");
+  EXPECT_FALSE(open()->has_rpmb());
+  EXPECT_FALSE(fs::exists(options.state / "version.tee-new"));
+  write("letter", "of a person who knows");
+  EXPECT_EQ(fault().first, std::nullopt) << "once it is a device's state, more files do no harm";
+}
+
 TEST_F(StateFolderTest, ThatCantBeMadeIsAnIoFault) {
   std::ofstream(folder.path() / "a") << "a file in the way";
   EXPECT_EQ(fault().first, world_fault::io);

@@ -1,0 +1,57 @@
+// Two ways to the same result, measured in turns: whatever the machine does meanwhile, it does to both.
+#ifndef BENCH_SIDE_BY_SIDE_H_
+#define BENCH_SIDE_BY_SIDE_H_
+
+#include <benchmark/benchmark.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstddef>
+#include <vector>
+
+namespace bench {
+
+/// How a ratio is meant: its target, and how often each way is gone in one iteration (more than once for ways that are
+/// short beside the clock's own cost).
+struct contest {
+  double target = 0;
+  int rounds = 1;
+};
+
+/// time_rounds answers the seconds of one round.
+template <class Way>
+double time_rounds(Way& way, int rounds) {
+  const auto start = std::chrono::steady_clock::now();
+  for (int i = 0; i < rounds; ++i) way();
+  return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count() / rounds;
+}
+
+inline double median(std::vector<double>& times) {
+  const auto middle = times.begin() + static_cast<std::ptrdiff_t>(times.size() / 2);
+  std::nth_element(times.begin(), middle, times.end());
+  return *middle;
+}
+
+/// run_side_by_side runs the TA's way and libcrypto's, and reports the ratio of their rates: 1 would be a TA that costs
+/// nothing. Medians, so that an interrupted round does not count.
+template <class Ta, class Libcrypto>
+void run_side_by_side(benchmark::State& state, const contest& terms, Ta ta, Libcrypto libcrypto) {
+  std::vector<double> ta_times, libcrypto_times;
+  bool ta_first = false;
+  for ([[maybe_unused]] auto _ : state) {
+    ta_first = !ta_first;
+    if (ta_first) ta_times.push_back(time_rounds(ta, terms.rounds));
+    libcrypto_times.push_back(time_rounds(libcrypto, terms.rounds));
+    if (!ta_first) ta_times.push_back(time_rounds(ta, terms.rounds));
+    state.SetIterationTime(ta_times.back());
+  }
+  const double ta_median = median(ta_times), libcrypto_median = median(libcrypto_times);
+  state.counters["ta_us"] = ta_median * 1e6;
+  state.counters["libcrypto_us"] = libcrypto_median * 1e6;
+  state.counters["ratio"] = libcrypto_median / ta_median;
+  if (terms.target != 0) state.counters["target"] = terms.target;
+}
+
+}  // namespace bench
+
+#endif  // BENCH_SIDE_BY_SIDE_H_
