@@ -36,10 +36,10 @@ void drop(TEE_ObjectHandle& place) {
 
 /// Draws a fresh RPMB KSK and stores its value.
 TEE_Result create_rpmb_ksk(object_handle& ksk) {
-  if (TEE_Result r = generate_secret_object(TEE_TYPE_HMAC_SHA256, ksk_bits, ksk); r != TEE_SUCCESS) return r;
+  if (TEE_Result r = generate_object(TEE_TYPE_HMAC_SHA256, ksk_bits, {}, ksk); r != TEE_SUCCESS) return r;
   wiped_array<ksk_size> value;
   uint32_t length = 0;
-  if (TEE_Result r = read_secret_value(ksk, value.bytes, &length); r != TEE_SUCCESS) return r;
+  if (TEE_Result r = read_attribute(ksk, TEE_ATTR_SECRET_VALUE, value.bytes, &length); r != TEE_SUCCESS) return r;
   if (length != ksk_size) {
     TRACE_ERROR("Wrong key size, expected %dB, got %dB", ksk_size, length);
     return TEE_ERROR_GENERIC;

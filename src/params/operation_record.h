@@ -3,6 +3,8 @@
 #define KEYMASTER_PARAMS_OPERATION_RECORD_H_
 
 #include "params/operation.h"
+#include "platform/handles.h"
+#include "platform/trace.h"
 
 namespace keymaster {
 
@@ -14,24 +16,43 @@ struct operation_entries {
   operation_finish finish;
 };
 
-/// new_operation makes a record with its entries filled; null when the heap is exhausted.
-template <class Record>
-[[nodiscard]] Record* new_operation(const operation_entries& entries) {
+/// make_record makes a record with its entries filled and has `prepare(record)` set it up, which answers the platform's
+/// result and leaves its own error in `*error`. Null, with nothing left behind, when that fails; want of memory for the
+/// record itself is `no_memory`.
+template <class Record, class Prepare>
+[[nodiscard]] keymaster_operation_t* make_record(const operation_entries& entries, TEE_Result* result,
+                                                 keymaster_error_t* error, Prepare&& prepare,
+                                                 keymaster_error_t no_memory = KM_ERROR_OK) {
   Record* const op = new_record<Record>();
-  if (op == nullptr) return nullptr;
+  if (op == nullptr) {
+    TRACE_ERROR("Out of memory");
+    *error = no_memory;
+    return nullptr;
+  }
   op->purpose = entries.purpose;
   op->free = entries.free;
   op->update = entries.update;
   op->finish = entries.finish;
-  return op;
-}
-
-/// finish_operation_record hands out `op` when its set-up succeeded, and deletes it otherwise.
-template <class Record>
-[[nodiscard]] keymaster_operation_t* finish_operation_record(Record* op, TEE_Result result, keymaster_error_t error) {
-  if (result == TEE_SUCCESS && error == KM_ERROR_OK) return op;
+  *result = prepare(*op);
+  if (*result == TEE_SUCCESS && *error == KM_ERROR_OK) return op;
   delete_record(op);
   return nullptr;
+}
+
+/// resolve_into makes the record's key by `resolve(TEE_ObjectHandle*)`.
+template <class Resolve>
+[[nodiscard]] TEE_Result resolve_into(object_handle& key, const keymaster_error_t* error, Resolve&& resolve) {
+  TEE_ObjectHandle made = TEE_HANDLE_NULL;
+  const TEE_Result result = resolve(&made);
+  key.reset(made);
+  if (result != TEE_SUCCESS || *error != KM_ERROR_OK) TRACE_ERROR("Resolve key data failed");
+  return result;
+}
+
+/// missing_handles counts which of key and operation a record lacks; freeing it traces a line for each.
+template <class Record>
+[[nodiscard]] uint32_t missing_handles(const Record& op) {
+  return (op.key ? 0U : 1U) + (op.operation ? 0U : 1U);
 }
 
 }  // namespace keymaster

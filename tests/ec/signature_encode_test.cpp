@@ -91,6 +91,16 @@ TEST_F(SignatureEncodeTest, AnIntegerOf127BytesCannotBeEncodedEither) {
   EXPECT_EQ(encode({1}, number_of(128, 1)), der_of({1}, number_of(128, 1)));
 }
 
+TEST_F(SignatureEncodeTest, TwoSuchIntegersStayInsideTheBufferToo) {
+  const bytes numbers[] = {number_of(127, 1), number_of(126, 0x80), number_of(127, 0x7F)};
+  for (const bytes& r : numbers) {
+    for (const bytes& s : numbers) {
+      EXPECT_FALSE(encode(r, s).has_value());
+      EXPECT_EQ(ta.errors(), (std::vector<std::string>{"Unfilled buffer, size calculation error"}));
+    }
+  }
+}
+
 TEST_F(SignatureEncodeTest, ASequenceOf255BytesHasALengthOfTwoBytes) {
   const auto first_bytes = [&](std::size_t r_size, std::size_t s_size) {
     return to_hex(encode(number_of(r_size, 1), number_of(s_size, 1)).value()).substr(0, 8);

@@ -69,11 +69,16 @@ bytes all_bytes() {
   return all;
 }
 
-TEST_F(SignatureSweepTest, NoInputOfUpToFourBytesIsASignature) {
+TEST_F(SignatureSweepTest, NoInputOfUpToTwoBytesAndNoTellingOneOfThreeOrFourIsASignature) {
+  const bytes telling = {0x00, 0x01, 0x02, 0x03, 0x04, 0x30, 0x7F, 0x80, 0x81, 0x82, 0xFE, 0xFF};
   for (std::size_t size = 0; size <= 2; ++size) every_string({}, all_bytes(), size, 2);
   every_string({0x30}, all_bytes(), 3, 2);
+  every_string({0x30}, telling, 4, 2);
   every_string({0x30, 0x02}, all_bytes(), 4, 2);
   every_string({0x30, 0x81}, all_bytes(), 4, 2);
+  for (const std::uint8_t first : all_bytes()) {
+    for (std::size_t size = 3; size <= 4; ++size) every_string({first}, telling, size, 2);
+  }
   EXPECT_EQ(accepted_, 0);
 }
 

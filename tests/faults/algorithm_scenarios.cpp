@@ -1,132 +1,13 @@
 // Scenarios of the algorithms beside RSA signatures: keys, and each step of each kind of operation.
 #include <gtest/gtest.h>
 
-#include "tests/faults/stage.h"
+#include "tests/faults/algorithm_kinds.h"
+#include "tests/support/ec_test_key.h"
 
 using namespace keymaster;
 
 namespace testing_support {
 namespace {
-
-/// A kind of operation: how its key is made, and what begin is asked for. What decrypts names its nonce, so that the
-/// ciphertext can be made with the same.
-struct kind {
-  std::string name;
-  param_list key;
-  bytes material;  // empty: the key is generated
-  std::uint32_t purpose;
-  param_list params;
-  bool finishes_despite_platform = false;
-};
-
-param_list free_key(std::uint32_t algorithm, std::uint32_t bits) {
-  return param_list{}.add(KM_TAG_ALGORITHM, algorithm).add(KM_TAG_KEY_SIZE, bits).add(KM_TAG_NO_AUTH_REQUIRED, 1);
-}
-
-param_list aes_key(std::uint32_t block_mode, std::uint32_t padding) {
-  return free_key(KM_ALGORITHM_AES, 128)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_ENCRYPT)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_DECRYPT)
-      .add(KM_TAG_BLOCK_MODE, block_mode)
-      .add(KM_TAG_PADDING, padding)
-      .add(KM_TAG_CALLER_NONCE, 1)
-      .add(KM_TAG_MIN_MAC_LENGTH, 96);
-}
-
-param_list aes_operation(std::uint32_t block_mode, std::uint32_t padding, std::size_t nonce) {
-  param_list params;
-  params.add(KM_TAG_BLOCK_MODE, block_mode).add(KM_TAG_PADDING, padding).add(KM_TAG_MAC_LENGTH, 96);
-  if (nonce != 0) params.add_blob(KM_TAG_NONCE, pattern(nonce));
-  return params;
-}
-
-kind aes(std::string name, std::uint32_t purpose, std::uint32_t block_mode, std::uint32_t padding, std::size_t nonce) {
-  // Only a tag that the platform calls wrong keeps a decryption from ending well.
-  const bool lenient = block_mode == KM_MODE_GCM && purpose == KM_PURPOSE_DECRYPT;
-  return {
-      std::move(name), aes_key(block_mode, padding), pattern(16), purpose, aes_operation(block_mode, padding, nonce),
-      lenient};
-}
-
-param_list ec_key() {
-  return free_key(KM_ALGORITHM_EC, 256)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_SIGN)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_VERIFY)
-      .add(KM_TAG_DIGEST, KM_DIGEST_NONE)
-      .add(KM_TAG_DIGEST, KM_DIGEST_SHA_2_256);
-}
-
-param_list hmac_key() {
-  return free_key(KM_ALGORITHM_HMAC, 256)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_SIGN)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_VERIFY)
-      .add(KM_TAG_DIGEST, KM_DIGEST_SHA_2_256)
-      .add(KM_TAG_MIN_MAC_LENGTH, 64);
-}
-
-param_list hmac_operation() {
-  return param_list{}.add(KM_TAG_DIGEST, KM_DIGEST_SHA_2_256).add(KM_TAG_MAC_LENGTH, 128);
-}
-
-param_list rsa_cipher_key() {
-  return rsa_key(1024)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_ENCRYPT)
-      .add(KM_TAG_PURPOSE, KM_PURPOSE_DECRYPT)
-      .add(KM_TAG_PADDING, KM_PAD_RSA_OAEP)
-      .add(KM_TAG_PADDING, KM_PAD_RSA_PKCS1_1_5_ENCRYPT);
-}
-
-kind rsa(std::string name, std::uint32_t purpose, std::uint32_t digest, std::uint32_t padding) {
-  return {std::move(name), rsa_cipher_key(), rsa_test_key::of_bits(1024).material(), purpose,
-          signature(digest, padding)};
-}
-
-std::vector<kind> kinds() {
-  const param_list ec_digest = param_list{}.add(KM_TAG_DIGEST, KM_DIGEST_SHA_2_256),
-                   ec_bare = param_list{}.add(KM_TAG_DIGEST, KM_DIGEST_NONE);
-  return {
-      aes("aes_ecb_encrypt", KM_PURPOSE_ENCRYPT, KM_MODE_ECB, KM_PAD_PKCS7, 0),
-      aes("aes_ecb_decrypt", KM_PURPOSE_DECRYPT, KM_MODE_ECB, KM_PAD_PKCS7, 0),
-      aes("aes_cbc_encrypt", KM_PURPOSE_ENCRYPT, KM_MODE_CBC, KM_PAD_PKCS7, 16),
-      aes("aes_cbc_decrypt", KM_PURPOSE_DECRYPT, KM_MODE_CBC, KM_PAD_PKCS7, 16),
-      aes("aes_cbc_unpadded_decrypt", KM_PURPOSE_DECRYPT, KM_MODE_CBC, KM_PAD_NONE, 16),
-      aes("aes_ctr_encrypt", KM_PURPOSE_ENCRYPT, KM_MODE_CTR, KM_PAD_NONE, 0),
-      aes("aes_gcm_encrypt", KM_PURPOSE_ENCRYPT, KM_MODE_GCM, KM_PAD_NONE, 0),
-      aes("aes_gcm_decrypt", KM_PURPOSE_DECRYPT, KM_MODE_GCM, KM_PAD_NONE, 12),
-      {"ec_sign", ec_key(), {}, KM_PURPOSE_SIGN, ec_digest},
-      {"ec_sign_without_digest", ec_key(), {}, KM_PURPOSE_SIGN, ec_bare},
-      {"ec_verify", ec_key(), {}, KM_PURPOSE_VERIFY, ec_digest},
-      {"hmac_sign", hmac_key(), pattern(32), KM_PURPOSE_SIGN, hmac_operation()},
-      {"hmac_verify", hmac_key(), pattern(32), KM_PURPOSE_VERIFY, hmac_operation()},
-      rsa("rsa_oaep_encrypt", KM_PURPOSE_ENCRYPT, KM_DIGEST_SHA_2_256, KM_PAD_RSA_OAEP),
-      rsa("rsa_oaep_decrypt", KM_PURPOSE_DECRYPT, KM_DIGEST_SHA_2_256, KM_PAD_RSA_OAEP),
-      rsa("rsa_pkcs1_encrypt", KM_PURPOSE_ENCRYPT, KM_DIGEST_NONE, KM_PAD_RSA_PKCS1_1_5_ENCRYPT),
-      rsa("rsa_pkcs1_decrypt", KM_PURPOSE_DECRYPT, KM_DIGEST_NONE, KM_PAD_RSA_PKCS1_1_5_ENCRYPT),
-      rsa("rsa_raw_decrypt", KM_PURPOSE_DECRYPT, KM_DIGEST_NONE, KM_PAD_NONE),
-  };
-}
-
-std::uint32_t counterpart(std::uint32_t purpose) {
-  return purpose == KM_PURPOSE_DECRYPT ? KM_PURPOSE_ENCRYPT : KM_PURPOSE_SIGN;
-}
-
-/// Makes the key, and what the operation is fed: a text, a ciphertext of it, or a text with its signature.
-void arrange(stage& on, const kind& what) {
-  on.blob =
-      what.material.empty() ? on.client().must_generate(what.key) : on.client().must_import(what.key, what.material);
-  on.params = what.params;
-  on.message = pattern(32);
-  if (what.purpose != KM_PURPOSE_DECRYPT && what.purpose != KM_PURPOSE_VERIFY) return;
-  const std::uint32_t handle = on.client().must_begin(counterpart(what.purpose), on.blob, on.params);
-  const answer fed = on.client().update(handle, on.message);
-  const finish_answer done = on.client().finish(handle);
-  ASSERT_TRUE(fed.ok() && done.ok());
-  if (what.purpose == KM_PURPOSE_VERIFY) {
-    on.signature = done.data;
-  } else {
-    on.message = join({fed.body(), done.data});
-  }
-}
 
 void end_it(stage& on, const answer& begun) {
   EXPECT_TRUE(on.client().abort(begun.b).ok());
@@ -145,7 +26,7 @@ scenario begin_of(const kind& what) {
 scenario update_of(const kind& what) {
   scenario play{"update_" + what.name, [what](stage& on) { arrange(on, what); },
                 [what](stage& on) { on.begin(what.purpose); },
-                [](stage& on) { return on.client().update(on.handle, on.message); },
+                [what](stage& on) { return on.client().update(on.handle, on.message, what.update_params()); },
                 [](stage& on, const answer& updated) {
                   EXPECT_EQ(updated.b, on.message.size());
                   EXPECT_TRUE(on.client().abort(on.handle).ok());
@@ -157,10 +38,32 @@ scenario finish_of(const kind& what) {
   scenario play{"finish_" + what.name, [what](stage& on) { arrange(on, what); },
                 [what](stage& on) {
                   on.begin(what.purpose);
-                  EXPECT_TRUE(on.client().update(on.handle, on.message).ok());
+                  EXPECT_TRUE(on.client().update(on.handle, on.message, what.update_params()).ok());
                 },
                 [](stage& on) { return on.client().finish(on.handle, on.signature); }};
   play.may_outlive_platform = what.finishes_despite_platform;
+  return play;
+}
+
+/// A begin that the operation itself refuses, the key allowing it.
+scenario refused_begin(const std::string& name, const kind& what, const param_list& params, std::int32_t error) {
+  scenario play{name,
+                [what](stage& on) { arrange(on, what); },
+                {},
+                [what, params](stage& on) { return on.client().begin(what.purpose, on.blob, params); }};
+  play.error = error;
+  return play;
+}
+
+/// A finish that fails by what it was fed, `change`d from what would have passed.
+scenario failing_finish(const std::string& name, const kind& what, std::int32_t error, const act& change) {
+  scenario play = finish_of(what);
+  play.name = "finish_" + name;
+  play.arrange = [what, change](stage& on) {
+    arrange(on, what);
+    change(on);
+  };
+  play.error = error;
   return play;
 }
 
@@ -183,24 +86,100 @@ scenario import_of(const std::string& name, const param_list& key, const bytes& 
   return play;
 }
 
+std::vector<scenario> refused_begins() {
+  kind lists_md5 = ec_kind("ec_sign", KM_PURPOSE_SIGN, KM_DIGEST_SHA_2_256);
+  lists_md5.key.add(KM_TAG_DIGEST, KM_DIGEST_MD5);
+  return {
+      refused_begin("begin_cbc_with_a_nonce_too_long", cbc_decrypt(), aes_kind_operation(KM_MODE_CBC, KM_PAD_PKCS7, 17),
+                    KM_ERROR_INVALID_ARGUMENT),
+      refused_begin("begin_gcm_with_a_nonce_too_short", gcm_decrypt(), aes_kind_operation(KM_MODE_GCM, KM_PAD_NONE, 11),
+                    KM_ERROR_INVALID_ARGUMENT),
+      refused_begin(
+          "begin_gcm_with_a_tag_of_100_bits", gcm_decrypt(),
+          aes_kind_operation(KM_MODE_GCM, KM_PAD_NONE, 12).remove(KM_TAG_MAC_LENGTH).add(KM_TAG_MAC_LENGTH, 100),
+          KM_ERROR_UNSUPPORTED_MAC_LENGTH),
+      refused_begin("begin_ec_with_md5", lists_md5, param_list{}.add(KM_TAG_DIGEST, KM_DIGEST_MD5),
+                    KM_ERROR_INCOMPATIBLE_DIGEST),
+      refused_begin("begin_hmac_without_a_length", hmac_kind("hmac_sign", KM_PURPOSE_SIGN),
+                    hmac_kind_operation().remove(KM_TAG_MAC_LENGTH), KM_ERROR_INVALID_ARGUMENT),
+      refused_begin("begin_hmac_with_too_short_a_length", hmac_kind("hmac_sign", KM_PURPOSE_SIGN),
+                    hmac_kind_operation().remove(KM_TAG_MAC_LENGTH).add(KM_TAG_MAC_LENGTH, 56),
+                    KM_ERROR_INVALID_MAC_LENGTH),
+  };
+}
+
+std::vector<scenario> failing_finishes() {
+  const act wrong_signature = [](stage& on) { on.signature = flip(on.signature, on.signature.size() - 1); };
+  const act wrong_end = [](stage& on) { on.message = flip(on.message, on.message.size() - 1); };
+  // With CBC a changed bit shows in the next block at the same place: here in the count of the padding.
+  const act wrong_padding = [](stage& on) { on.message = flip(on.message, on.message.size() - 17); };
+  return {
+      failing_finish("ec_verify_wrong", ec_kind("", KM_PURPOSE_VERIFY, KM_DIGEST_SHA_2_256),
+                     KM_ERROR_VERIFICATION_FAILED, wrong_signature),
+      failing_finish("ec_verify_no_der", ec_kind("", KM_PURPOSE_VERIFY, KM_DIGEST_NONE), KM_ERROR_VERIFICATION_FAILED,
+                     [](stage& on) { on.signature.pop_back(); }),
+      failing_finish("hmac_verify_wrong", hmac_kind("", KM_PURPOSE_VERIFY), KM_ERROR_VERIFICATION_FAILED,
+                     wrong_signature),
+      failing_finish("gcm_decrypt_wrong_tag", gcm_decrypt(), KM_ERROR_VERIFICATION_FAILED, wrong_end),
+      failing_finish("cbc_decrypt_wrong_padding", cbc_decrypt(), KM_ERROR_INVALID_ARGUMENT, wrong_padding),
+      failing_finish("cbc_decrypt_broken_block", cbc_decrypt(), KM_ERROR_INVALID_INPUT_LENGTH,
+                     [](stage& on) { on.message.pop_back(); }),
+      failing_finish("cbc_encrypt_broken_block", aes_kind("", KM_PURPOSE_ENCRYPT, KM_MODE_CBC, KM_PAD_NONE, 16),
+                     KM_ERROR_INVALID_INPUT_LENGTH, [](stage& on) { on.message.pop_back(); }),
+      failing_finish("rsa_oaep_encrypt_too_long",
+                     rsa_kind("", KM_PURPOSE_ENCRYPT, KM_DIGEST_SHA_2_256, KM_PAD_RSA_OAEP),
+                     KM_ERROR_INVALID_INPUT_LENGTH, [](stage& on) { on.message = pattern(63); }),
+      failing_finish("rsa_oaep_decrypt_wrong_padding",
+                     rsa_kind("", KM_PURPOSE_DECRYPT, KM_DIGEST_SHA_2_256, KM_PAD_RSA_OAEP), KM_ERROR_INVALID_ARGUMENT,
+                     wrong_end),
+      failing_finish("rsa_raw_encrypt_too_large_a_number",
+                     rsa_kind("", KM_PURPOSE_ENCRYPT, KM_DIGEST_NONE, KM_PAD_NONE), KM_ERROR_INVALID_ARGUMENT,
+                     [](stage& on) { on.message = bytes(128, 0xFF); }),
+  };
+}
+
+/// Updates that are not the only one of their operation.
+std::vector<scenario> further_updates() {
+  scenario held = update_of(cbc_decrypt());
+  held.name = "update_aes_cbc_decrypt_with_a_block_held_back";
+  held.approach = [](stage& on) {
+    on.begin(KM_PURPOSE_DECRYPT);
+    const bytes block(on.message.begin(), on.message.begin() + 16);
+    EXPECT_TRUE(on.client().update(on.handle, block).ok());
+  };
+  const kind sealing = with_aad(gcm_encrypt());
+  scenario aad_alone = update_of(sealing);
+  aad_alone.name = "update_aes_gcm_encrypt_with_aad_alone";
+  aad_alone.run = [sealing](stage& on) { return on.client().update(on.handle, {}, sealing.update_params()); };
+  aad_alone.settle = [](stage& on, const answer& updated) {
+    EXPECT_EQ(updated.b, 0U);
+    EXPECT_TRUE(on.client().abort(on.handle).ok());
+  };
+  return {held, aad_alone};
+}
+
 }  // namespace
 
 std::vector<scenario> algorithm_scenarios() {
   std::vector<scenario> all = {
-      generate_of("aes", aes_key(KM_MODE_GCM, KM_PAD_NONE)),
-      generate_of("ec", ec_key()),
-      generate_of("hmac", hmac_key()),
-      import_of("aes", aes_key(KM_MODE_CBC, KM_PAD_PKCS7), pattern(16)),
-      import_of("hmac", hmac_key(), pattern(32)),
-      import_of("hmac_with_size_unsaid", hmac_key().remove(KM_TAG_KEY_SIZE), pattern(32)),
+      generate_of("aes", aes_kind_key(KM_MODE_GCM, KM_PAD_NONE)),
+      generate_of("ec", ec_kind_key()),
+      generate_of("hmac", hmac_kind_key()),
+      import_of("aes", aes_kind_key(KM_MODE_CBC, KM_PAD_PKCS7), pattern(16)),
+      import_of("ec", ec_kind_key(), ec_test_key::of_bits(256).material()),
+      import_of("hmac", hmac_kind_key(), pattern(32)),
+      import_of("hmac_with_size_unsaid", hmac_kind_key().remove(KM_TAG_KEY_SIZE), pattern(32)),
   };
-  for (const kind& each : kinds()) {
+  for (const auto& some : {refused_begins(), failing_finishes(), further_updates()}) {
+    all.insert(all.end(), some.begin(), some.end());
+  }
+  for (const kind& each : every_kind()) {
     all.push_back(begin_of(each));
     all.push_back(update_of(each));
     all.push_back(finish_of(each));
   }
   all.push_back({"export_ec",
-                 [](stage& on) { on.blob = on.client().must_generate(ec_key()); },
+                 [](stage& on) { on.blob = on.client().must_generate(ec_kind_key()); },
                  {},
                  [](stage& on) { return on.client().export_key(on.blob); }});
   return all;

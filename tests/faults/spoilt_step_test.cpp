@@ -2,6 +2,8 @@
 #include <gmock/gmock.h>
 
 #include "tests/faults/stage.h"
+#include "tests/support/encryption.h"
+#include "tests/support/hmac_test_key.h"
 
 using namespace keymaster;
 
@@ -66,6 +68,109 @@ TEST_F(SpoiltStepTest, ASpoiltDigestVerifiesNothing) {
   EXPECT_TRUE(on.client().update(on.handle, on.message).ok());
   expect_failed(on.client().finish(on.handle, good), TEEC_ERROR_GENERIC,
                 {"DigestDoFinal failed with 0xffff0000\n", "Finish failed"});
+}
+
+/// A GCM operation whose associated data never arrived.
+class SpoiltAssociatedDataTest : public SpoiltStepTest {
+ protected:
+  const bytes raw = pattern(16, 7), nonce = pattern(12, 8), aad = from_text("whom it is for");
+
+  void begin_and_spoil(std::uint32_t purpose) {
+    on.blob = on.client().must_import(aes_key(128), raw);
+    on.params = gcm(128, nonce);
+    on.begin(purpose);
+    spoil("TEE_AEUpdateAAD");
+    on.tee.clear_trace();
+    EXPECT_TRUE(feed({}, aad).ok());
+  }
+  answer feed(const bytes& input, const bytes& associated = {}) {
+    param_list params;
+    if (!associated.empty()) params.add_blob(KM_TAG_ASSOCIATED_DATA, associated);
+    return on.client().update(on.handle, input, params);
+  }
+  [[nodiscard]] bytes sealed(const bytes& text, const bytes& associated) const {
+    return aes_encrypt({KM_MODE_GCM, KM_PAD_NONE, raw, nonce, associated}, text);
+  }
+};
+
+TEST_F(SpoiltAssociatedDataTest, NothingIsDecryptedWithoutIt) {
+  begin_and_spoil(KM_PURPOSE_DECRYPT);
+  expect_failed(feed(sealed(on.message, aad)), TEEC_ERROR_GENERIC,
+                {"AEUpdate failed with 0xffff0000\n", "Update failed"});
+  EXPECT_EQ(on.client().finish(on.handle).error, KM_ERROR_INVALID_OPERATION_HANDLE);
+}
+
+TEST_F(SpoiltAssociatedDataTest, NothingIsEncryptedWithoutIt) {
+  begin_and_spoil(KM_PURPOSE_ENCRYPT);
+  expect_failed(feed(on.message), TEEC_ERROR_GENERIC, {"AEUpdate failed with 0xffff0000\n", "Update failed"});
+}
+
+TEST_F(SpoiltAssociatedDataTest, NoTagIsMadeWithoutIt) {
+  begin_and_spoil(KM_PURPOSE_ENCRYPT);
+  expect_failed(on.client().finish(on.handle), TEEC_ERROR_GENERIC,
+                {"AEEncryptFinal failed with 0xffff0000\n", "Finish failed"});
+}
+
+TEST_F(SpoiltAssociatedDataTest, NoTagIsRightWithoutIt) {
+  // Neither that of the data that were sent, nor that of those that have arrived.
+  for (const bytes& associated : {aad, bytes{}}) {
+    begin_and_spoil(KM_PURPOSE_DECRYPT);
+    EXPECT_TRUE(feed(sealed({}, associated)).ok());
+    const finish_answer got = on.client().finish(on.handle);
+    expect_failed(got, TEEC_SUCCESS, {"Finish failed"});
+    EXPECT_EQ(got.error, KM_ERROR_VERIFICATION_FAILED);
+  }
+}
+
+TEST_F(SpoiltAssociatedDataTest, WhatArrivesLaterDoesNotHealIt) {
+  begin_and_spoil(KM_PURPOSE_DECRYPT);
+  EXPECT_TRUE(feed({}, aad).ok());
+  EXPECT_TRUE(feed(sealed({}, aad)).ok());
+  EXPECT_EQ(on.client().finish(on.handle).error, KM_ERROR_VERIFICATION_FAILED);
+}
+
+TEST_F(SpoiltStepTest, ACipherThatCouldNotBeStartedGivesNothingOut) {
+  on.blob = on.client().must_import(aes_key(128), pattern(16));
+  struct spoilt_mode {
+    std::uint32_t purpose, mode, padding;
+    bytes nonce;
+    const char* line;  // of the finish, without any data
+  };
+  constexpr const char *update_line = "CipherUpdate failed with 0xffff0000\n",
+                       *final_line = "CipherDoFinal failed with 0xffff0000\n";
+  for (const spoilt_mode& row : {spoilt_mode{KM_PURPOSE_ENCRYPT, KM_MODE_ECB, KM_PAD_NONE, {}, final_line},
+                                 {KM_PURPOSE_ENCRYPT, KM_MODE_CBC, KM_PAD_PKCS7, pattern(16), update_line},
+                                 {KM_PURPOSE_DECRYPT, KM_MODE_CBC, KM_PAD_PKCS7, pattern(16), final_line},
+                                 {KM_PURPOSE_DECRYPT, KM_MODE_CTR, KM_PAD_NONE, pattern(16), final_line}}) {
+    on.params = cipher(row.mode, row.padding, row.nonce);
+    for (const bool with_data : {true, false}) {
+      spoil("TEE_CipherInit");
+      on.begin(row.purpose);
+      on.tee.clear_trace();
+      if (with_data) {
+        expect_failed(on.client().update(on.handle, pattern(32)), TEEC_ERROR_GENERIC, {update_line, "Update failed"});
+      } else {
+        expect_failed(on.client().finish(on.handle), TEEC_ERROR_GENERIC, {row.line, "Finish failed"});
+      }
+    }
+  }
+}
+
+TEST_F(SpoiltStepTest, AMacThatCouldNotBeStartedOrFedIsNeitherMadeNorHeld) {
+  on.blob = on.client().must_import(hmac_key(KM_DIGEST_SHA_2_256, 256), pattern(32));
+  on.params = hmac_length(64);
+  for (const std::uint32_t purpose : {KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY}) {
+    for (const char* const step : {"TEE_MACInit", "TEE_MACUpdate"}) {
+      faults.clear();
+      if (std::string_view(step) == "TEE_MACInit") spoil(step, 2);  // the first is that of the blob's key
+      on.begin(purpose);
+      if (!faults.triggered()) spoil(step);
+      EXPECT_TRUE(on.client().update(on.handle, on.message).ok());
+      on.tee.clear_trace();
+      expect_failed(on.client().finish(on.handle, bytes(8)), TEEC_ERROR_GENERIC,
+                    {"MACComputeFinal failed with 0xffff0000\n", "Finish failed"});
+    }
+  }
 }
 
 TEST_F(SpoiltStepTest, ABlobKeyIsNotDerivedFromASpoiltMac) {

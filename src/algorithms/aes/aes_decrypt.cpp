@@ -135,17 +135,16 @@ TEE_Result finish_blocks(aes_decrypt_operation_t& op, secret_bytes& output, keym
 
 keymaster_operation_t* create_aes_decrypt(const operation_request& request, TEE_Result* result,
                                           keymaster_error_t* error) {
-  auto* const op = new_operation<aes_decrypt_operation_t>(
-      {KM_PURPOSE_DECRYPT, aes_decrypt_free, aes_decrypt_update, aes_decrypt_finish});
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    return nullptr;
-  }
-  *result = prepare_aes_operation(*op, request, TEE_MODE_DECRYPT, allocate_tag_buffer, error);
-  if (*result == TEE_SUCCESS && *error == KM_ERROR_OK) *result = start_aes_operation(*op, request, error);
-  if (*result == TEE_SUCCESS && *error == KM_ERROR_OK) *error = allocate_last_block(*op);
-  if (*result != TEE_SUCCESS || *error != KM_ERROR_OK) request.out_params.reset();
-  return finish_operation_record(op, *result, *error);
+  keymaster_operation_t* const made = make_record<aes_decrypt_operation_t>(
+      {KM_PURPOSE_DECRYPT, aes_decrypt_free, aes_decrypt_update, aes_decrypt_finish}, result, error,
+      [&](aes_decrypt_operation_t& op) {
+        TEE_Result r = prepare_aes_operation(op, request, TEE_MODE_DECRYPT, allocate_tag_buffer, error);
+        if (r == TEE_SUCCESS && *error == KM_ERROR_OK) r = start_aes_operation(op, request, error);
+        if (r == TEE_SUCCESS && *error == KM_ERROR_OK) *error = allocate_last_block(op);
+        return r;
+      });
+  if (made == nullptr) request.out_params.reset();  // the nonce is told before the last allocation
+  return made;
 }
 
 TEE_Result aes_decrypt_update(keymaster_operation_t* op, const keymaster_key_param_set_t& in_params,

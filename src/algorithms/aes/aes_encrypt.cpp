@@ -74,15 +74,13 @@ TEE_Result finish_stream(aes_encrypt_operation_t& op, secret_bytes& output, keym
 
 keymaster_operation_t* create_aes_encrypt(const operation_request& request, TEE_Result* result,
                                           keymaster_error_t* error) {
-  auto* const op = new_operation<aes_encrypt_operation_t>(
-      {KM_PURPOSE_ENCRYPT, aes_encrypt_free, aes_encrypt_update, aes_encrypt_finish});
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    return nullptr;
-  }
-  *result = prepare_aes_operation(*op, request, TEE_MODE_ENCRYPT, no_tag_buffer, error);
-  if (*result == TEE_SUCCESS && *error == KM_ERROR_OK) *result = start_aes_operation(*op, request, error);
-  return finish_operation_record(op, *result, *error);
+  return make_record<aes_encrypt_operation_t>(
+      {KM_PURPOSE_ENCRYPT, aes_encrypt_free, aes_encrypt_update, aes_encrypt_finish}, result, error,
+      [&](aes_encrypt_operation_t& op) {
+        const TEE_Result prepared = prepare_aes_operation(op, request, TEE_MODE_ENCRYPT, no_tag_buffer, error);
+        if (prepared != TEE_SUCCESS || *error != KM_ERROR_OK) return prepared;
+        return start_aes_operation(op, request, error);
+      });
 }
 
 TEE_Result aes_encrypt_update(keymaster_operation_t* op, const keymaster_key_param_set_t& in_params,

@@ -1,5 +1,6 @@
 #include "algorithms/aes/aes_key.h"
 
+#include "params/generated_key.h"
 #include "params/key_tags.h"
 #include "platform/cursor.h"
 #include "platform/key_objects.h"
@@ -48,13 +49,7 @@ TEE_Result write_generated(const object_handle& key, uint32_t bits, secret_bytes
   byte_writer out{key_data.span()};
   std::span<uint8_t> value;
   if (!out.write_u32(bits) || !out.reserve(bits / 8, value)) return TEE_ERROR_GENERIC;
-  uint32_t length = 0;
-  if (TEE_Result r = read_secret_value(key, value, &length); r != TEE_SUCCESS) return r;
-  if (length != value.size()) {
-    TRACE_ERROR("Buffer size modified, before %dB, after %dB", bits / 8, length);
-    *error = KM_ERROR_UNKNOWN_ERROR;
-  }
-  return TEE_SUCCESS;
+  return write_attribute(key, TEE_ATTR_SECRET_VALUE, value, error);
 }
 
 TEE_Result generate(keymaster_key_param_set_t* params, secret_bytes& key_data, keymaster_error_t* error) {
@@ -65,18 +60,14 @@ TEE_Result generate(keymaster_key_param_set_t* params, secret_bytes& key_data, k
   if (*error == KM_ERROR_OK) *error = check_block_modes(*params);
   if (*error != KM_ERROR_OK) return TEE_SUCCESS;
   object_handle key;
-  if (TEE_Result r = generate_secret_object(TEE_TYPE_AES, bits, key); r != TEE_SUCCESS) return r;
+  if (TEE_Result r = generate_object(TEE_TYPE_AES, bits, {}, key); r != TEE_SUCCESS) return r;
   return write_generated(key, bits, key_data, error);
 }
 
 }  // namespace
 
 TEE_Result aes_generate_key(keymaster_key_param_set_t* params, secret_bytes& key_data, keymaster_error_t* error) {
-  key_data.reset();
-  *error = KM_ERROR_OK;
-  const TEE_Result result = generate(params, key_data, error);
-  if (result != TEE_SUCCESS || *error != KM_ERROR_OK) key_data.reset();
-  return result;
+  return generate_key_data(generate, params, key_data, error);
 }
 
 TEE_Result aes_import_key(keymaster_key_param_set_t* params, std::span<const uint8_t> material, secret_bytes& key_data,

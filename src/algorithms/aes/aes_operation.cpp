@@ -4,6 +4,8 @@
 
 #include "algorithms/aes/aes_key.h"
 #include "params/key_tags.h"
+#include "params/operation_record.h"
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
@@ -64,18 +66,6 @@ keymaster_error_t check_padding(const aes_operation_t& op, const mode_row** row)
   return accepted ? KM_ERROR_OK : KM_ERROR_INCOMPATIBLE_PADDING_MODE;
 }
 
-TEE_Result make_operation(aes_operation_t& op, uint32_t algorithm, uint32_t mode) {
-  if (TEE_Result r = op.operation.allocate(algorithm, mode, op.key_size); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateOperation failed with 0x%08x\n", r);
-    return r;
-  }
-  if (TEE_Result r = TEE_SetOperationKey(op.operation.get(), op.key.get()); r != TEE_SUCCESS) {
-    TRACE_ERROR("SetOperationKey failed with 0x%08x\n", r);
-    return r;
-  }
-  return TEE_SUCCESS;
-}
-
 /// The client's nonce, or a drawn one. Empty, with KM_ERROR_OK, for ECB without one.
 keymaster_error_t choose_nonce(const mode_row& row, const keymaster_key_param_set_t& in_params,
                                std::span<uint8_t, longest_nonce> place, std::span<const uint8_t>& nonce) {
@@ -119,19 +109,17 @@ keymaster_error_t report_nonce(std::span<const uint8_t> nonce, parameter_set& ou
 
 TEE_Result prepare_aes_operation(aes_operation_t& op, const operation_request& request, uint32_t mode,
                                  keymaster_error_t (*allocate_tag)(aes_operation_t& op), keymaster_error_t* error) {
-  TEE_ObjectHandle key = TEE_HANDLE_NULL;
-  const TEE_Result resolved = aes_resolve_key_data(request.key_data, &key, &op.key_size, error);
-  op.key.reset(key);
-  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) {
-    TRACE_ERROR("Resolve key data failed");
-    return resolved;
-  }
+  const TEE_Result resolved = resolve_into(op.key, error, [&](TEE_ObjectHandle* key) {
+    return aes_resolve_key_data(request.key_data, key, &op.key_size, error);
+  });
+  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) return resolved;
   const mode_row* row = nullptr;
   *error = read_mode(op, request.in_params);
   if (*error == KM_ERROR_OK && op.is_gcm()) *error = read_mac_length(op, request.in_params);
   if (*error == KM_ERROR_OK && op.is_gcm()) *error = allocate_tag(op);
   if (*error == KM_ERROR_OK) *error = check_padding(op, &row);
-  return *error == KM_ERROR_OK ? make_operation(op, row->algorithm, mode) : TEE_SUCCESS;
+  if (*error != KM_ERROR_OK) return TEE_SUCCESS;
+  return make_operation(row->algorithm, mode, op.key_size, op.key, op.operation);
 }
 
 TEE_Result start_aes_operation(aes_operation_t& op, const operation_request& request, keymaster_error_t* error) {
@@ -185,8 +173,7 @@ void trace_aes_free(const aes_operation_t* op) {
     TRACE_ERROR("Try to free NULL aes_encrypt_operation_t");
     return;
   }
-  if (!op->key) TRACE_ERROR("Try to free invalid aes_encrypt_operation_t");
-  if (!op->operation) TRACE_ERROR("Try to free invalid aes_encrypt_operation_t");
+  for (uint32_t n = missing_handles(*op); n > 0; --n) TRACE_ERROR("Try to free invalid aes_encrypt_operation_t");
 }
 
 }  // namespace keymaster

@@ -2,7 +2,7 @@
 
 #include <array>
 
-#include "platform/handles.h"
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
@@ -61,12 +61,7 @@ TEE_Result ec_resolve_key_data(std::span<const uint8_t> key_data, TEE_ObjectHand
   TEE_InitValueAttribute(&attributes[3], TEE_ATTR_ECC_CURVE, curve->curve, 0);
 
   object_handle object;
-  if (TEE_Result r = object.allocate(TEE_TYPE_ECDSA_KEYPAIR, fields.key_size); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateTransientObject failed with 0x%08x\n", r);
-    return r;
-  }
-  if (TEE_Result r = TEE_PopulateTransientObject(object.get(), attributes, 4); r != TEE_SUCCESS) {
-    TRACE_ERROR("PopulateTransientObject failed with 0x%08x\n", r);
+  if (TEE_Result r = populate_object(TEE_TYPE_ECDSA_KEYPAIR, fields.key_size, attributes, object); r != TEE_SUCCESS) {
     return r;
   }
   *key = object.release();

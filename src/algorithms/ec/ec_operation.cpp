@@ -7,6 +7,7 @@
 #include "algorithms/ec/ec_key_data.h"
 #include "algorithms/ec/ec_signature_der.h"
 #include "params/operation_record.h"
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
@@ -22,12 +23,6 @@ ec_operation_t& record(keymaster_operation_t* op) {
   return *static_cast<ec_operation_t*>(op);
 }
 
-TEE_Result allocate_traced(operation_handle& operation, uint32_t algorithm, uint32_t mode, uint32_t key_size) {
-  const TEE_Result result = operation.allocate(algorithm, mode, key_size);
-  if (result != TEE_SUCCESS) TRACE_ERROR("AllocateOperation failed with 0x%08x\n", result);
-  return result;
-}
-
 TEE_Result prepare_digest(ec_operation_t& op, const keymaster_key_param_set_t& in_params, keymaster_error_t* error) {
   const keymaster_key_param_t* const digest = key_param_set_get_unique(in_params, KM_TAG_DIGEST);
   if (digest == nullptr) {
@@ -40,17 +35,14 @@ TEE_Result prepare_digest(ec_operation_t& op, const keymaster_key_param_set_t& i
   if (digest->enumerated >= digest_algorithms.size()) *error = KM_ERROR_UNSUPPORTED_DIGEST;
   if (*error != KM_ERROR_OK) return TEE_SUCCESS;
   op.uses_digest = true;
-  return allocate_traced(op.digest_operation, digest_algorithms[digest->enumerated], TEE_MODE_DIGEST, 0);
+  return make_digest_operation(digest_algorithms[digest->enumerated], op.digest_operation);
 }
 
 TEE_Result prepare(ec_operation_t& op, const operation_request& request, uint32_t mode, keymaster_error_t* error) {
-  TEE_ObjectHandle key = TEE_HANDLE_NULL;
-  const TEE_Result resolved = ec_resolve_key_data(request.key_data, &key, &op.key_size, error);
-  op.key.reset(key);
-  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) {
-    TRACE_ERROR("Resolve key data failed");
-    return resolved;
-  }
+  const TEE_Result resolved = resolve_into(op.key, error, [&](TEE_ObjectHandle* key) {
+    return ec_resolve_key_data(request.key_data, key, &op.key_size, error);
+  });
+  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) return resolved;
   const ec_curve* const curve = find_ec_curve(op.key_size);
   if (curve == nullptr) {
     TRACE_ERROR("Unsupported key size %d", op.key_size);
@@ -64,24 +56,7 @@ TEE_Result prepare(ec_operation_t& op, const operation_request& request, uint32_
     *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
     return TEE_SUCCESS;
   }
-  if (TEE_Result r = allocate_traced(op.operation, curve->algorithm, mode, op.key_size); r != TEE_SUCCESS) return r;
-  if (TEE_Result r = TEE_SetOperationKey(op.operation.get(), op.key.get()); r != TEE_SUCCESS) {
-    TRACE_ERROR("SetOperationKey failed with 0x%08x\n", r);
-    return r;
-  }
-  return TEE_SUCCESS;
-}
-
-template <class Record>
-keymaster_operation_t* create(const operation_request& request, const operation_entries& entries, uint32_t mode,
-                              TEE_Result* result, keymaster_error_t* error) {
-  Record* const op = new_operation<Record>(entries);
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    return nullptr;
-  }
-  *result = prepare(*op, request, mode, error);
-  return finish_operation_record(op, *result, *error);
+  return make_operation(curve->algorithm, mode, op.key_size, op.key, op.operation);
 }
 
 /// Cuts the digest to the leftmost key-size bits, as ECDSA has it (FIPS 186-4, section 6.4). Where the key size is no
@@ -118,22 +93,19 @@ bool allocate_raw_signature(const ec_operation_t& op, secret_bytes& raw, keymast
   return false;
 }
 
-/// How many of key and operation a record lacks; freeing it traces a line for each.
-uint32_t missing_members(const ec_operation_t& op) {
-  return (op.key ? 0U : 1U) + (op.operation ? 0U : 1U);
-}
-
 }  // namespace
 
 keymaster_operation_t* create_ec_sign(const operation_request& request, TEE_Result* result, keymaster_error_t* error) {
-  return create<ec_sign_operation_t>(request, {KM_PURPOSE_SIGN, ec_sign_free, ec_update, ec_sign_finish}, TEE_MODE_SIGN,
-                                     result, error);
+  return make_record<ec_sign_operation_t>(
+      {KM_PURPOSE_SIGN, ec_sign_free, ec_update, ec_sign_finish}, result, error,
+      [&](ec_operation_t& op) { return prepare(op, request, TEE_MODE_SIGN, error); });
 }
 
 keymaster_operation_t* create_ec_verify(const operation_request& request, TEE_Result* result,
                                         keymaster_error_t* error) {
-  return create<ec_verify_operation_t>(request, {KM_PURPOSE_VERIFY, ec_verify_free, ec_update, ec_verify_finish},
-                                       TEE_MODE_VERIFY, result, error);
+  return make_record<ec_verify_operation_t>(
+      {KM_PURPOSE_VERIFY, ec_verify_free, ec_update, ec_verify_finish}, result, error,
+      [&](ec_operation_t& op) { return prepare(op, request, TEE_MODE_VERIFY, error); });
 }
 
 TEE_Result ec_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,
@@ -169,7 +141,11 @@ TEE_Result ec_sign_finish(keymaster_operation_t* op, const keymaster_key_param_s
     TRACE_ERROR("AsymmetricSignDigest failed with 0x%08x\n", r);
     return r;
   }
-  const std::span<const uint8_t> halves = raw.span().first(std::min(length, raw.size()));
+  if (length == 0 || length > raw.size() || length % 2 != 0) {  // no two halves that can have been written
+    *error = KM_ERROR_UNKNOWN_ERROR;
+    return TEE_SUCCESS;
+  }
+  const std::span<const uint8_t> halves = raw.span().first(length);
   heap_bytes encoded;
   if (!der_encode_ec_signature(halves.first(halves.size() / 2), halves.subspan(halves.size() / 2), encoded)) {
     TRACE_ERROR("Out of memory");
@@ -216,7 +192,7 @@ void ec_sign_free(keymaster_operation_t* op) {
     TRACE_ERROR("Try to free NULL ec_sign_operation_t");
     return;
   }
-  for (uint32_t n = missing_members(*sign); n > 0; --n) TRACE_ERROR("Try to free invalid ec_sign_operation_t");
+  for (uint32_t n = missing_handles(*sign); n > 0; --n) TRACE_ERROR("Try to free invalid ec_sign_operation_t");
   delete_record(sign);
 }
 
@@ -226,7 +202,7 @@ void ec_verify_free(keymaster_operation_t* op) {
     TRACE_ERROR("Try to free NULL ec_verify_operation_t");
     return;
   }
-  for (uint32_t n = missing_members(*verify); n > 0; --n) TRACE_ERROR("Try to free invalid ec_verify_operation_t");
+  for (uint32_t n = missing_handles(*verify); n > 0; --n) TRACE_ERROR("Try to free invalid ec_verify_operation_t");
   delete_record(verify);
 }
 

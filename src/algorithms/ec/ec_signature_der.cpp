@@ -26,8 +26,8 @@ uint32_t content_size(std::span<const uint8_t> value) {
   return static_cast<uint32_t>(value.size()) + (needs_sign_byte(value) ? 1 : 0);
 }
 
-/// The size of a length field. It allows one byte up to 127 where encode_length writes one up to 126; see the test of a
-/// sequence of 127 bytes.
+/// The size of a length field. It counts one byte up to 127 where encode_length writes one up to 126: such a value
+/// cannot be encoded.
 uint32_t length_field_size(uint32_t length) {
   const uint32_t bytes = der_length_bytes(length);
   return bytes == 1 && length < 128 ? 1 : bytes + 1;
@@ -158,9 +158,9 @@ bool der_encode_ec_signature(std::span<const uint8_t> r, std::span<const uint8_t
   s = strip_zeros(s);
   const uint32_t body = element_size(content_size(r)) + element_size(content_size(s));
   const uint32_t total = element_size(body);
-  // One byte more, for the length that is counted shorter than it is written.
+  // Each of the three lengths may be written one byte longer than it is counted.
   heap_bytes buffer;
-  if (!buffer.allocate(total + 1)) {
+  if (!buffer.allocate(total + 3)) {
     TRACE_ERROR("Out of memory");
     return false;
   }

@@ -2,6 +2,7 @@
 
 #include <array>
 
+#include "params/generated_key.h"
 #include "params/key_tags.h"
 #include "platform/cursor.h"
 #include "platform/key_objects.h"
@@ -98,29 +99,19 @@ TEE_Result generate(keymaster_key_param_set_t* params, secret_bytes& key_data, k
   if (*error != KM_ERROR_OK) return TEE_SUCCESS;
 
   object_handle key;
-  if (TEE_Result r = generate_secret_object(rule->object_type, bits, key); r != TEE_SUCCESS) return r;
+  if (TEE_Result r = generate_object(rule->object_type, bits, {}, key); r != TEE_SUCCESS) return r;
   std::span<uint8_t> value;
   if (!lay_out(bits, rule->object_type, key_data, value)) {
     *error = KM_ERROR_UNKNOWN_ERROR;
     return TEE_SUCCESS;
   }
-  uint32_t length = 0;
-  if (TEE_Result r = read_secret_value(key, value, &length); r != TEE_SUCCESS) return r;
-  if (length != value.size()) {
-    TRACE_ERROR("Buffer size modified, before %dB, after %dB", bits / 8, length);
-    *error = KM_ERROR_UNKNOWN_ERROR;
-  }
-  return TEE_SUCCESS;
+  return write_attribute(key, TEE_ATTR_SECRET_VALUE, value, error);
 }
 
 }  // namespace
 
 TEE_Result hmac_generate_key(keymaster_key_param_set_t* params, secret_bytes& key_data, keymaster_error_t* error) {
-  key_data.reset();
-  *error = KM_ERROR_OK;
-  const TEE_Result result = generate(params, key_data, error);
-  if (result != TEE_SUCCESS || *error != KM_ERROR_OK) key_data.reset();
-  return result;
+  return generate_key_data(generate, params, key_data, error);
 }
 
 TEE_Result hmac_import_key(keymaster_key_param_set_t* params, std::span<const uint8_t> material, secret_bytes& key_data,

@@ -5,6 +5,7 @@
 
 #include "algorithms/hmac/hmac_key.h"
 #include "params/operation_record.h"
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
@@ -38,12 +39,8 @@ TEE_Result start_mac(hmac_operation_t& op, uint32_t object_type, keymaster_error
     *error = KM_ERROR_INVALID_KEY_BLOB;
     return TEE_SUCCESS;
   }
-  if (TEE_Result r = op.operation.allocate(row->algorithm, TEE_MODE_MAC, op.key_size); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateOperation failed with 0x%08x\n", r);
-    return r;
-  }
-  if (TEE_Result r = TEE_SetOperationKey(op.operation.get(), op.key.get()); r != TEE_SUCCESS) {
-    TRACE_ERROR("SetOperationKey failed with 0x%08x\n", r);
+  if (TEE_Result r = make_operation(row->algorithm, TEE_MODE_MAC, op.key_size, op.key, op.operation);
+      r != TEE_SUCCESS) {
     return r;
   }
   TEE_MACInit(op.operation.get(), nullptr, 0);
@@ -51,14 +48,11 @@ TEE_Result start_mac(hmac_operation_t& op, uint32_t object_type, keymaster_error
 }
 
 TEE_Result prepare(hmac_operation_t& op, const operation_request& request, keymaster_error_t* error) {
-  TEE_ObjectHandle key = TEE_HANDLE_NULL;
   uint32_t object_type = 0;
-  const TEE_Result resolved = hmac_resolve_key_data(request.key_data, &key, &object_type, &op.key_size, error);
-  op.key.reset(key);
-  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) {
-    TRACE_ERROR("Resolve key data failed");
-    return resolved;
-  }
+  const TEE_Result resolved = resolve_into(op.key, error, [&](TEE_ObjectHandle* key) {
+    return hmac_resolve_key_data(request.key_data, key, &object_type, &op.key_size, error);
+  });
+  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) return resolved;
   const keymaster_key_param_t* const mac_length = key_param_set_get_unique(request.in_params, KM_TAG_MAC_LENGTH);
   if (mac_length == nullptr) {
     TRACE_ERROR("No or too many KM_TAG_MAC_LENGTH");
@@ -67,18 +61,6 @@ TEE_Result prepare(hmac_operation_t& op, const operation_request& request, keyma
   }
   op.mac_length = mac_length->integer;
   return start_mac(op, object_type, error);
-}
-
-template <class Record>
-keymaster_operation_t* create(const operation_request& request, const operation_entries& entries, TEE_Result* result,
-                              keymaster_error_t* error) {
-  Record* const op = new_operation<Record>(entries);
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    return nullptr;
-  }
-  *result = prepare(*op, request, error);
-  return finish_operation_record(op, *result, *error);
 }
 
 /// Computes the MAC and keeps as many of its bytes as the client wants.
@@ -94,32 +76,29 @@ TEE_Result compute(hmac_operation_t& op, secret_bytes& wanted, keymaster_error_t
     TRACE_ERROR("MACComputeFinal failed with 0x%08x\n", r);
     return r;
   }
+  length = std::min(length, longest_mac);  // what there is room for, whatever the platform claims
   if (length < wanted.size()) {
     TRACE_ERROR("Too short output of HMAC operation, expect at least %dB, got %dB", wanted.size(), length);
     *error = KM_ERROR_UNKNOWN_ERROR;
     return TEE_SUCCESS;
   }
-  std::copy_n(mac.bytes, std::min(wanted.size(), longest_mac), wanted.data());
+  std::copy_n(mac.bytes, wanted.size(), wanted.data());
   return TEE_SUCCESS;
-}
-
-/// How many of key and operation a record lacks; freeing it traces a line for each.
-uint32_t missing_members(const hmac_operation_t& op) {
-  return (op.key ? 0U : 1U) + (op.operation ? 0U : 1U);
 }
 
 }  // namespace
 
 keymaster_operation_t* create_hmac_sign(const operation_request& request, TEE_Result* result,
                                         keymaster_error_t* error) {
-  return create<hmac_sign_operation_t>(request, {KM_PURPOSE_SIGN, hmac_sign_free, hmac_update, hmac_sign_finish},
-                                       result, error);
+  return make_record<hmac_sign_operation_t>({KM_PURPOSE_SIGN, hmac_sign_free, hmac_update, hmac_sign_finish}, result,
+                                            error, [&](hmac_operation_t& op) { return prepare(op, request, error); });
 }
 
 keymaster_operation_t* create_hmac_verify(const operation_request& request, TEE_Result* result,
                                           keymaster_error_t* error) {
-  return create<hmac_verify_operation_t>(
-      request, {KM_PURPOSE_VERIFY, hmac_verify_free, hmac_update, hmac_verify_finish}, result, error);
+  return make_record<hmac_verify_operation_t>({KM_PURPOSE_VERIFY, hmac_verify_free, hmac_update, hmac_verify_finish},
+                                              result, error,
+                                              [&](hmac_operation_t& op) { return prepare(op, request, error); });
 }
 
 TEE_Result hmac_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,
@@ -159,7 +138,7 @@ void hmac_sign_free(keymaster_operation_t* op) {
     TRACE_ERROR("Try to free NULL hmac_sign_operation_t");
     return;
   }
-  for (uint32_t n = missing_members(*sign); n > 0; --n) TRACE_ERROR("Try to free invalid hmac_sign_operation_t");
+  for (uint32_t n = missing_handles(*sign); n > 0; --n) TRACE_ERROR("Try to free invalid hmac_sign_operation_t");
   delete_record(sign);
 }
 
@@ -169,7 +148,7 @@ void hmac_verify_free(keymaster_operation_t* op) {
     TRACE_ERROR("Try to free NULL hmac_verify_operation_t");
     return;
   }
-  for (uint32_t n = missing_members(*verify); n > 0; --n) TRACE_ERROR("Try to free invalid hmac_verify_operation_t");
+  for (uint32_t n = missing_handles(*verify); n > 0; --n) TRACE_ERROR("Try to free invalid hmac_verify_operation_t");
   delete_record(verify);
 }
 

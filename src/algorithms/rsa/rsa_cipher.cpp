@@ -67,18 +67,6 @@ TEE_Result prepare(rsa_operation_t& op, const operation_request& request, const 
   return set_rsa_operation(op, algorithm, way.mode);
 }
 
-template <class Record>
-keymaster_operation_t* create(const operation_request& request, const direction& way, const operation_entries& entries,
-                              TEE_Result* result, keymaster_error_t* error) {
-  Record* const op = new_operation<Record>(entries);
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    return nullptr;
-  }
-  *result = prepare(*op, request, way, error);
-  return finish_operation_record(op, *result, *error);
-}
-
 /// Whether the padding has room for the message. The limit may be negative: a short key has none for a long digest.
 keymaster_error_t check_message_fits(const rsa_operation_t& op) {
   const int64_t k = op.modulus_size();
@@ -147,16 +135,16 @@ bool update(rsa_operation_t& op, std::span<const uint8_t> input, uint32_t* input
 
 keymaster_operation_t* create_rsa_encrypt(const operation_request& request, TEE_Result* result,
                                           keymaster_error_t* error) {
-  return create<rsa_encrypt_operation_t>(request, encryption,
-                                         {KM_PURPOSE_ENCRYPT, rsa_encrypt_free, rsa_encrypt_update, rsa_encrypt_finish},
-                                         result, error);
+  return make_record<rsa_encrypt_operation_t>(
+      {KM_PURPOSE_ENCRYPT, rsa_encrypt_free, rsa_encrypt_update, rsa_encrypt_finish}, result, error,
+      [&](rsa_operation_t& op) { return prepare(op, request, encryption, error); });
 }
 
 keymaster_operation_t* create_rsa_decrypt(const operation_request& request, TEE_Result* result,
                                           keymaster_error_t* error) {
-  return create<rsa_decrypt_operation_t>(request, decryption,
-                                         {KM_PURPOSE_DECRYPT, rsa_decrypt_free, rsa_decrypt_update, rsa_decrypt_finish},
-                                         result, error);
+  return make_record<rsa_decrypt_operation_t>(
+      {KM_PURPOSE_DECRYPT, rsa_decrypt_free, rsa_decrypt_update, rsa_decrypt_finish}, result, error,
+      [&](rsa_operation_t& op) { return prepare(op, request, decryption, error); });
 }
 
 TEE_Result rsa_encrypt_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,

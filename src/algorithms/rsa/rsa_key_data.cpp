@@ -1,6 +1,6 @@
 #include "algorithms/rsa/rsa_key_data.h"
 
-#include "platform/handles.h"
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
@@ -28,20 +28,13 @@ TEE_Result rsa_resolve_key_data(std::span<const uint8_t> key_data, TEE_ObjectHan
   rsa_components components;
   if (!read_rsa_components(in, components)) return TEE_ERROR_GENERIC;
 
-  object_handle object;
-  if (TEE_Result r = object.allocate(TEE_TYPE_RSA_KEYPAIR, key_size); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateTransientObject failed with 0x%08x\n", r);
-    return r;
-  }
   TEE_Attribute attributes[rsa_component_count];
   for (uint32_t i = 0; i < rsa_component_count; ++i) {
     TEE_InitRefAttribute(&attributes[i], rsa_component_attributes[i], components[i].data(),
                          static_cast<uint32_t>(components[i].size()));
   }
-  if (TEE_Result r = TEE_PopulateTransientObject(object.get(), attributes, rsa_component_count); r != TEE_SUCCESS) {
-    TRACE_ERROR("PopulateTransientObject failed with 0x%08x\n", r);
-    return r;
-  }
+  object_handle object;
+  if (TEE_Result r = populate_object(TEE_TYPE_RSA_KEYPAIR, key_size, attributes, object); r != TEE_SUCCESS) return r;
   *key = object.release();
   if (key_size_bits != nullptr) *key_size_bits = key_size;
   return TEE_SUCCESS;

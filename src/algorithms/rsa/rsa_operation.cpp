@@ -3,18 +3,16 @@
 #include <cstring>
 
 #include "algorithms/rsa/rsa_key_data.h"
+#include "params/operation_record.h"
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
 
 TEE_Result resolve_rsa_key(rsa_operation_t& op, std::span<const uint8_t> key_data, keymaster_error_t* error) {
-  TEE_ObjectHandle key = TEE_HANDLE_NULL;
-  const TEE_Result result = rsa_resolve_key_data(key_data, &key, &op.key_size, error);
-  op.key.reset(key);
-  if (result != TEE_SUCCESS || *error != KM_ERROR_OK) {
-    TRACE_ERROR("Resolve key data failed");
-    return result;
-  }
+  const TEE_Result resolved = resolve_into(
+      op.key, error, [&](TEE_ObjectHandle* key) { return rsa_resolve_key_data(key_data, key, &op.key_size, error); });
+  if (resolved != TEE_SUCCESS || *error != KM_ERROR_OK) return resolved;
   if (!op.buffer.allocate(op.modulus_size())) {
     TRACE_ERROR("Out of memory");
     *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
@@ -23,15 +21,7 @@ TEE_Result resolve_rsa_key(rsa_operation_t& op, std::span<const uint8_t> key_dat
 }
 
 TEE_Result set_rsa_operation(rsa_operation_t& op, uint32_t algorithm, uint32_t mode) {
-  if (TEE_Result r = op.operation.allocate(algorithm, mode, op.key_size); r != TEE_SUCCESS) {
-    TRACE_ERROR("AllocateOperation failed with 0x%08x\n", r);
-    return r;
-  }
-  if (TEE_Result r = TEE_SetOperationKey(op.operation.get(), op.key.get()); r != TEE_SUCCESS) {
-    TRACE_ERROR("SetOperationKey failed with 0x%08x\n", r);
-    return r;
-  }
-  return TEE_SUCCESS;
+  return make_operation(algorithm, mode, op.key_size, op.key, op.operation);
 }
 
 bool gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t limit, uint32_t* total) {
@@ -44,7 +34,7 @@ bool gather_message(rsa_operation_t& op, std::span<const uint8_t> input, int64_t
 }
 
 uint32_t missing_members(const rsa_operation_t& op) {
-  return (op.key ? 0U : 1U) + (op.operation ? 0U : 1U) + (op.buffer ? 0U : 1U);
+  return missing_handles(op) + (op.buffer ? 0U : 1U);
 }
 
 void right_align(std::span<uint8_t> block, uint32_t length) {

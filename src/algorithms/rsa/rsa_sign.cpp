@@ -125,16 +125,13 @@ TEE_Result sign_statement(rsa_sign_operation_t& op, const keymaster_key_param_se
 }  // namespace
 
 keymaster_operation_t* create_rsa_sign(const operation_request& request, TEE_Result* result, keymaster_error_t* error) {
-  auto* const op =
-      new_operation<rsa_sign_operation_t>({KM_PURPOSE_SIGN, rsa_sign_free, rsa_sign_update, rsa_sign_finish});
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
-    return nullptr;
-  }
-  *error = prepare_soter(*op, request.characteristics);
-  if (*error == KM_ERROR_OK) *result = prepare_signature_operation(*op, request, error);
-  return finish_operation_record(op, *result, *error);
+  return make_record<rsa_sign_operation_t>(
+      {KM_PURPOSE_SIGN, rsa_sign_free, rsa_sign_update, rsa_sign_finish}, result, error,
+      [&](rsa_sign_operation_t& op) {
+        *error = prepare_soter(op, request.characteristics);
+        return *error == KM_ERROR_OK ? prepare_signature_operation(op, request, error) : TEE_SUCCESS;
+      },
+      KM_ERROR_MEMORY_ALLOCATION_FAILED);
 }
 
 TEE_Result rsa_sign_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,

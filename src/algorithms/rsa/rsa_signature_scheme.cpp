@@ -3,6 +3,7 @@
 #include <array>
 #include <cstring>
 
+#include "platform/key_objects.h"
 #include "platform/trace.h"
 
 namespace keymaster {
@@ -36,13 +37,6 @@ static_assert([] {
 constexpr uint32_t pkcs1_overhead = 11;
 /// What PSS needs beside the digest, as this system counts it: the trailer byte, a flag bit and a salt of 20 bytes.
 constexpr uint32_t pss_overhead = 22;
-
-TEE_Result allocate_digest_operation(rsa_operation_t& op, uint32_t digest_algorithm) {
-  if (digest_algorithm == 0) return TEE_SUCCESS;
-  const TEE_Result result = op.digest_operation.allocate(digest_algorithm, TEE_MODE_DIGEST, 0);
-  if (result != TEE_SUCCESS) TRACE_ERROR("AllocateOperation failed with 0x%08x\n", result);
-  return result;
-}
 
 keymaster_error_t check_pss_fits(const rsa_operation_t& op) {
   if (op.padding != KM_PAD_RSA_PSS) return KM_ERROR_OK;
@@ -111,10 +105,12 @@ TEE_Result prepare_signature_operation(rsa_operation_t& op, const operation_requ
   if (*error == KM_ERROR_OK) *error = choose_signature_scheme(op.padding, op.digest, &scheme);
   if (*error != KM_ERROR_OK) return TEE_SUCCESS;
 
-  if (TEE_Result r = allocate_digest_operation(op, scheme.digest_algorithm); r != TEE_SUCCESS) return r;
+  const bool with_digest = scheme.digest_algorithm != 0;
+  if (with_digest) {
+    if (TEE_Result r = make_digest_operation(scheme.digest_algorithm, op.digest_operation); r != TEE_SUCCESS) return r;
+  }
   *error = check_pss_fits(op);
   if (*error != KM_ERROR_OK) return TEE_SUCCESS;
-  const bool with_digest = scheme.digest_algorithm != 0;
   return set_rsa_operation(op, scheme.rsa_algorithm, platform_mode(op.purpose, with_digest));
 }
 

@@ -59,15 +59,10 @@ TEE_Result verify_raw(rsa_verify_operation_t& op, secret_bytes& recovered, std::
 
 keymaster_operation_t* create_rsa_verify(const operation_request& request, TEE_Result* result,
                                          keymaster_error_t* error) {
-  auto* const op =
-      new_operation<rsa_verify_operation_t>({KM_PURPOSE_VERIFY, rsa_verify_free, rsa_verify_update, rsa_verify_finish});
-  if (op == nullptr) {
-    TRACE_ERROR("Out of memory");
-    *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
-    return nullptr;
-  }
-  *result = prepare_signature_operation(*op, request, error);
-  return finish_operation_record(op, *result, *error);
+  return make_record<rsa_verify_operation_t>(
+      {KM_PURPOSE_VERIFY, rsa_verify_free, rsa_verify_update, rsa_verify_finish}, result, error,
+      [&](rsa_verify_operation_t& op) { return prepare_signature_operation(op, request, error); },
+      KM_ERROR_MEMORY_ALLOCATION_FAILED);
 }
 
 TEE_Result rsa_verify_update(keymaster_operation_t* op, const keymaster_key_param_set_t& /*in_params*/,

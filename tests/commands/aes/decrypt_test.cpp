@@ -117,8 +117,10 @@ TEST_F(AesDecryptTest, DataThatEndInsideABlockAreRefusedAtTheEndBehindTheBlocksB
     SCOPED_TRACE(size);
     std::uint32_t handle = begin_decrypting(padded);
     EXPECT_EQ(fed(handle, first(whole, size)), first(pattern(40), size / 16 * 16));
+    const std::uint32_t ends = tee.world().faults().call_count("TEE_CipherDoFinal");
     (void)expect_lost(refused(KM_ERROR_INVALID_INPUT_LENGTH, {"Input data not align to block size", "Finish failed"}),
                       handle, before, [&] { return client().finish(handle); });
+    EXPECT_EQ(tee.world().faults().call_count("TEE_CipherDoFinal"), ends) << "the platform is not asked";
     // Without padding it is the platform that refuses.
     handle = begin_decrypting(asking(KM_MODE_CBC));
     (void)fed(handle, first(whole, size));

@@ -1,5 +1,7 @@
 // Generating on P-521, whose values may need 66 bytes where 65 are offered: a key that doesn't fit is thrown away and
 // another one made, so often and no more.
+#include <fmt/format.h>
+
 #include "tests/commands/command_fixture.h"
 #include "tests/support/ec_test_key.h"
 
@@ -92,6 +94,48 @@ TEST_F(EcGenerateP521Test, OnceMeasuredAKeyIsNotMadeAgain) {
   }
   tee.world().faults().fail_call(read_call, 4, TEE_ERROR_SHORT_BUFFER);
   expect_given_up(TEEC_ERROR_SHORT_BUFFER, "GetObjectBufferAttribute failed with 0xffff0010\n", 1);
+}
+
+TEST_F(EcGenerateP521Test, WhateverFailsInAnyAttemptFailsTheCommandAndLeavesNothingBehind) {
+  hosted_tee::fault_plan& faults = tee.world().faults();
+  // Two keys are thrown away, and the third one fits, whatever the platform says of its values.
+  const auto third_fits = [&] {
+    faults.clear();
+    short_reads(2);
+    for (std::uint32_t n = 1; n <= 6; ++n) {
+      faults.override_output(read_call, n, [](std::uint32_t* length, TEE_Result& result) {
+        *length = 65;
+        result = TEE_SUCCESS;
+      });
+    }
+  };
+  const auto generate = [&] { return client().generate(ec_key(521), 2048); };
+  third_fits();
+  const hosted_tee::accounting before = tee.accounting();
+  (void)succeeds(generate);
+  EXPECT_EQ(calls("TEE_GenerateKey"), 3U);
+  const std::uint32_t allocations = faults.allocations(), fallible = faults.fallible_calls();
+
+  const auto expect_clean_failure = [&] {
+    const answer a = generate();
+    EXPECT_FALSE(a.ok());
+    EXPECT_NE(a.error, KM_ERROR_OK);
+    EXPECT_EQ(a.size, 0U);
+    EXPECT_EQ(a.output, bytes(2048, 0));
+    expect_same(before);
+  };
+  for (std::uint32_t n = 1; n <= allocations; ++n) {
+    SCOPED_TRACE(fmt::format("allocation {} of {}", n, allocations));
+    third_fits();
+    faults.fail_allocation(n);
+    expect_clean_failure();
+  }
+  for (std::uint32_t n = 1; n <= fallible; ++n) {
+    SCOPED_TRACE(fmt::format("platform call {} of {}", n, fallible));
+    third_fits();
+    faults.fail_any_call(n, TEE_ERROR_OUT_OF_MEMORY);
+    expect_clean_failure();
+  }
 }
 
 TEST_F(EcGenerateP521Test, GeneratedKeysWorkAndHaveShortValues) {

@@ -130,18 +130,29 @@ TEST_F(EcSignTest, WithoutMemoryThereIsNoSignature) {
   }
 }
 
-TEST_F(EcSignTest, FalseLengthsOfThePlatformStayInsideTheBuffers) {
+TEST_F(EcSignTest, AFalseLengthOfADigestStaysInsideTheBuffer) {
   const bytes blob = import(256);
-  for (const char* const call : {"TEE_DigestDoFinal", "TEE_AsymmetricSignDigest"}) {
-    for (const std::uint32_t length : {0U, 1U, 31U, 63U, 65U, 129U, 0xFFFFFFFFU}) {
-      SCOPED_TRACE(fmt::format("{} {}", call, length));
-      const std::uint32_t handle = started(blob, KM_DIGEST_SHA_2_256, {1});
-      tee.world().faults().override_output(call, 1,
-                                           [length](std::uint32_t* reported, TEE_Result&) { *reported = length; });
-      const finish_answer made = succeeds([&] { return client().finish(handle); });
-      EXPECT_EQ(made.data.at(0), 0x30);
-      EXPECT_LE(made.data.size(), 72U);
-    }
+  for (const std::uint32_t length : {0U, 1U, 31U, 63U, 65U, 129U, 0xFFFFFFFFU}) {
+    SCOPED_TRACE(length);
+    const std::uint32_t handle = started(blob, KM_DIGEST_SHA_2_256, {1});
+    tee.world().faults().override_output("TEE_DigestDoFinal", 1,
+                                         [length](std::uint32_t* reported, TEE_Result&) { *reported = length; });
+    const finish_answer made = succeeds([&] { return client().finish(handle); });
+    EXPECT_EQ(made.data.at(0), 0x30);
+    EXPECT_LE(made.data.size(), 72U);
+  }
+}
+
+TEST_F(EcSignTest, ASignatureThatHasNoTwoHalvesIsNotHandedOut) {
+  const bytes blob = import(256);
+  const hosted_tee::accounting before = tee.accounting();
+  for (const std::uint32_t length : {0U, 1U, 63U, 65U, 66U, 128U, 0xFFFFFFFFU}) {
+    SCOPED_TRACE(length);
+    const std::uint32_t handle = started(blob, KM_DIGEST_SHA_2_256, {1});
+    tee.world().faults().override_output("TEE_AsymmetricSignDigest", 1,
+                                         [length](std::uint32_t* reported, TEE_Result&) { *reported = length; });
+    (void)expect_lost(refused(KM_ERROR_UNKNOWN_ERROR, {"Finish failed"}), handle, before,
+                      [&] { return client().finish(handle); });
   }
 }
 

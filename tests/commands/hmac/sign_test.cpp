@@ -24,6 +24,10 @@ class HmacSignTest : public CommandTest {
     EXPECT_EQ(client().update(handle, message).b, message.size());
     return handle;
   }
+  void claim(std::uint32_t length) {
+    tee.world().faults().override_output("TEE_MACComputeFinal", 1,
+                                         [length](std::uint32_t* reported, TEE_Result&) { *reported = length; });
+  }
 };
 
 TEST_F(HmacSignTest, MacsOfEachDigestAndKeySizeAreLibcryptos) {
@@ -101,10 +105,6 @@ TEST_F(HmacSignTest, AFailingComputationIsThePlatformsFailure) {
 }
 
 TEST_F(HmacSignTest, FalseLengthsOfThePlatformStayInsideTheBuffers) {
-  const auto claim = [&](std::uint32_t length) {
-    tee.world().faults().override_output("TEE_MACComputeFinal", 1,
-                                         [length](std::uint32_t* reported, TEE_Result&) { *reported = length; });
-  };
   const hosted_tee::accounting before = tee.accounting();
   for (const std::uint32_t length : {0U, 1U, 31U}) {
     const std::uint32_t handle = started(KM_PURPOSE_SIGN, 256);
@@ -114,11 +114,28 @@ TEST_F(HmacSignTest, FalseLengthsOfThePlatformStayInsideTheBuffers) {
                                "Finish failed"}),
                       handle, before, [&] { return client().finish(handle); });
   }
-  for (const std::uint32_t bits : {256U, 520U, 4096U}) {  // beyond any MAC there is nothing but zeros
-    const std::uint32_t handle = started(KM_PURPOSE_SIGN, bits);
-    claim(0xFFFFFFFF);
-    const bytes made = succeeds([&] { return client().finish(handle); }).data;
-    EXPECT_EQ(made, first(join({hmac_of(KM_DIGEST_SHA_2_256, key, message), bytes(512)}), bits / 8));
+  const std::uint32_t handle = started(KM_PURPOSE_SIGN, 256);
+  claim(0xFFFFFFFF);
+  EXPECT_EQ(succeeds([&] { return client().finish(handle); }).data, hmac_of(KM_DIGEST_SHA_2_256, key, message));
+}
+
+TEST_F(HmacSignTest, APlatformThatClaimsMoreThanAnyMacHasDoesNotMakeOneLonger) {
+  const hosted_tee::accounting before = tee.accounting();
+  for (const std::uint32_t purpose : {KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY}) {
+    for (const std::uint32_t bits : {520U, 4096U}) {
+      for (const std::uint32_t length : {65U, 512U, 0xFFFFFFFFU}) {
+        SCOPED_TRACE(fmt::format("purpose {}, {} bits, a claim of {} bytes", purpose, bits, length));
+        const std::uint32_t handle = started(purpose, bits);
+        claim(length);
+        // What a MAC of 64 bytes would have behind it.
+        const bytes zeros_behind = first(join({hmac_of(KM_DIGEST_SHA_2_256, key, message), bytes(512)}), bits / 8);
+        (void)expect_lost(
+            refused(KM_ERROR_UNKNOWN_ERROR,
+                    {fmt::format("Too short output of HMAC operation, expect at least {}B, got 64B", bits / 8),
+                     "Finish failed"}),
+            handle, before, [&] { return client().finish(handle, zeros_behind); });
+      }
+    }
   }
 }
 

@@ -8,6 +8,7 @@
 #include "tests/commands/command_fixture.h"
 #include "tests/commands/raw_session.h"
 #include "tests/support/ec_test_key.h"
+#include "tests/support/encryption.h"
 #include "tests/support/hmac_test_key.h"
 
 using namespace keymaster;
@@ -175,6 +176,22 @@ TEST_F(DoubleFetchTest, AnEcSignatureThatChangesWhileItIsVerified) {
   attack(request, {0, 4, 6, 38, 40}, [&] {
     const std::uint32_t handle = client().must_begin(KM_PURPOSE_VERIFY, pair, ec_digest(KM_DIGEST_SHA_2_256));
     return session.call(KM_COMMAND_FINISH, handle, memref(request), memref(response));
+  });
+}
+
+TEST_F(DoubleFetchTest, APlaintextThatChangesWhileItsLastBlockIsReadBack) {
+  const bytes key = pattern(16), iv = pattern(16, 2);
+  const bytes secret = client().must_import(aes_key(128), key);
+  bytes request = join({prefixed(aes_encrypt({KM_MODE_CBC, KM_PAD_PKCS7, key, iv}, pattern(40))), prefixed(u32(0))});
+  attack(response, {0, 12, 28, 32, 40, 44}, [&] {
+    const std::uint32_t handle = client().must_begin(KM_PURPOSE_DECRYPT, secret, cipher(KM_MODE_CBC, KM_PAD_PKCS7, iv));
+    const raw_answer got = session.call(KM_COMMAND_UPDATE, handle, memref(request), memref(response));
+    EXPECT_EQ(got.result, TEE_SUCCESS);
+    EXPECT_EQ(got.size, 32U);
+    const finish_answer done = client().finish(handle);  // right, or without its padding
+    EXPECT_EQ(done.result, TEE_SUCCESS);
+    EXPECT_LE(done.data.size(), 16U);
+    return got;
   });
 }
 

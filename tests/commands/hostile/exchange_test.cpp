@@ -6,6 +6,7 @@
 #include "tests/commands/command_fixture.h"
 #include "tests/commands/raw_session.h"
 #include "tests/commands/sealed_blob.h"
+#include "tests/support/ec_test_key.h"
 
 using namespace keymaster;
 
@@ -115,38 +116,42 @@ TEST_F(ExchangeTest, TheCharacteristicsAreThoseOfOneBlob) {
   });
 }
 
-TEST_F(ExchangeTest, ImportedMaterialIsStoredAsItWasParsed) {
-  const bytes params = rsa_key(512).remove(KM_TAG_RSA_PUBLIC_EXPONENT).marshal();  // that of the material
-  const bytes material = rsa_test_key::of_bits(512).material();
-  bytes other = material;
-  for (std::size_t at = 0; at < other.size(); at += 4 + u32_at(material, at)) {
-    other[at + 4 + u32_at(material, at) / 2] ^= 0x10;  // in the middle of each component
+/// Keys and signatures as they come from outside.
+class ExchangedMaterialTest : public ExchangeTest {
+ protected:
+  void expect_stored_as_parsed(const param_list& params, const bytes& material, const bytes& other) {
+    const bytes request_head = prefixed(params.marshal());
+    const bytes first = join({request_head, material}), second = join({request_head, other});
+    const bytes ksk = stored_ksk();
+    const auto import = [&](bytes& request, const arm& armed) {
+      const bytes got = body(call(KM_COMMAND_IMPORT_KEY, 0, request, armed));
+      return open_blob(ksk, {got.begin() + 4, got.begin() + 4 + u32_at(got, 0)}).value();
+    };
+    bytes request = first;
+    const bytes sealed_first = import(request, {});
+    request = second;
+    const bytes sealed_second = import(request, {});
+    sweep(first, second, [&](bytes& exchanged, const arm& armed) {
+      const bytes sealed = import(exchanged, armed);
+      if (sealed == sealed_first) return taken::first;
+      return sealed == sealed_second ? taken::second : taken::neither;
+    });
   }
-  const bytes first = join({prefixed(params), material}), second = join({prefixed(params), other});
-  const bytes ksk = stored_ksk();
-  const auto import = [&](bytes& request, const arm& armed) {
-    const bytes got = body(call(KM_COMMAND_IMPORT_KEY, 0, request, armed));
-    return open_blob(ksk, {got.begin() + 4, got.begin() + 4 + u32_at(got, 0)}).value();
-  };
-  bytes request = first;
-  const bytes sealed_first = import(request, {});
-  request = second;
-  const bytes sealed_second = import(request, {});
-  sweep(first, second, [&](bytes& exchanged, const arm& armed) {
-    const bytes sealed = import(exchanged, armed);
-    if (sealed == sealed_first) return taken::first;
-    return sealed == sealed_second ? taken::second : taken::neither;
-  });
-}
 
-TEST_F(ExchangeTest, ASignatureIsVerifiedAsItWasTaken) {
-  const bytes blob = import_fixed(1024), message = from_text("message");
-  for (const param_list& scheme :
-       {signature(KM_DIGEST_NONE, KM_PAD_RSA_PKCS1_1_5_SIGN), signature(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PSS)}) {
-    const bytes good = client().sign(blob, scheme, message).data;
+  /// changed flips a bit in the middle of each field from `at` on.
+  static bytes changed(bytes material, std::size_t at) {
+    const bytes as_it_was = material;
+    for (; at < material.size(); at += 4 + u32_at(as_it_was, at)) {
+      material[at + 4 + u32_at(as_it_was, at) / 2] ^= 0x10;
+    }
+    return material;
+  }
+
+  void expect_verified_as_taken(const bytes& blob, const param_list& scheme, const bytes& message, const bytes& good) {
     bytes bad = good;
     bad.back() ^= 1;
     const auto request_for = [](const bytes& made) { return join({prefixed(made), prefixed(u32(0))}); };
+    tee.clear_trace();
     sweep(request_for(good), request_for(bad), [&](bytes& request, const arm& armed) {
       const std::uint32_t handle = client().must_begin(KM_PURPOSE_VERIFY, blob, scheme);
       EXPECT_TRUE(client().update(handle, message).ok());
@@ -155,6 +160,34 @@ TEST_F(ExchangeTest, ASignatureIsVerifiedAsItWasTaken) {
       return got.error == KM_ERROR_VERIFICATION_FAILED ? taken::second : taken::neither;
     });
   }
+};
+
+TEST_F(ExchangedMaterialTest, AnRsaKeyIsStoredAsItWasParsed) {
+  const bytes material = rsa_test_key::of_bits(512).material();
+  expect_stored_as_parsed(rsa_key(512).remove(KM_TAG_RSA_PUBLIC_EXPONENT),  // that of the material
+                          material, changed(material, 0));
+}
+
+TEST_F(ExchangedMaterialTest, AnEcKeyIsStoredAsItWasParsed) {
+  const bytes material = ec_test_key::of_bits(256).material();
+  expect_stored_as_parsed(ec_key(256), material, changed(material, 4));
+}
+
+TEST_F(ExchangedMaterialTest, AnRsaSignatureIsVerifiedAsItWasTaken) {
+  const bytes blob = import_fixed(1024), message = from_text("message");
+  for (const param_list& scheme :
+       {signature(KM_DIGEST_NONE, KM_PAD_RSA_PKCS1_1_5_SIGN), signature(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PSS)}) {
+    expect_verified_as_taken(blob, scheme, message, client().sign(blob, scheme, message).data);
+  }
+}
+
+TEST_F(ExchangedMaterialTest, AnEcSignatureIsVerifiedAsItWasTaken) {
+  // It is read twice: decoded, and compared with the only form of what was decoded.
+  const ec_test_key& key = ec_test_key::of_bits(256);
+  const bytes digest = pattern(32);
+  expect_verified_as_taken(client().must_import(ec_key(256), key.material()), ec_digest(KM_DIGEST_NONE), digest,
+                           key.sign(KM_DIGEST_NONE, digest));
+  EXPECT_FALSE(tee.traced("Encoding mismatch"));
 }
 
 }  // namespace
