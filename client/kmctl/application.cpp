@@ -5,10 +5,12 @@
 #include <algorithm>
 #include <array>
 #include <cstdlib>
-#include <iostream>
+#include <memory>
+#include <sstream>
 #include <string_view>
 
 #include "client/kmctl/commands.h"
+#include "client/kmctl/console.h"
 #include "client/kmctl/exit_codes.h"
 
 namespace kmctl {
@@ -26,8 +28,10 @@ constexpr std::array command_rows = std::to_array<command_row>({
     {"import", "Seal an existing private key into a blob", define_import},
     {"export", "Write a key's public part", define_export},
     {"characteristics", "Show what a key may be used for", define_characteristics},
-    {"sign", "Sign a file", define_sign},
-    {"verify", "Check a file's signature", define_verify},
+    {"sign", "Sign a file, or make its MAC", define_sign},
+    {"verify", "Check a file's signature or MAC", define_verify},
+    {"encrypt", "Encrypt a file", define_encrypt},
+    {"decrypt", "Decrypt a file", define_decrypt},
     {"delete", "Delete a key", define_delete},
     {"delete-all", "Ask the TA to delete every key", define_delete_all},
     {"demo", "Show on a file of yours what the system does", define_demo},
@@ -55,7 +59,8 @@ void add_global_options(CLI::App& app, context& ctx) {
   app.add_option("--state", ctx.state, "folder of the device's state; a blob opens only with the state that sealed it")
       ->type_name("FOLDER")
       ->excludes(tee);
-  app.add_flag("--json", ctx.json_output, "print results and errors as JSON");
+  app.add_flag("--json", ctx.json_output,
+               "print results and errors as JSON: to standard output, or to standard error when data goes there");
   app.add_option_function<std::string>(
          "--trace", [](const std::string& level) { ::setenv("KEYMASTER_TRACE", level.c_str(), 1); },
          "print the secure world's trace on standard error: error, info or debug")
@@ -69,23 +74,25 @@ bool asks_for_json(int argc, const char* const* argv) {
   return std::any_of(argv, argv + argc, [](const char* word) { return std::string_view(word) == "--json"; });
 }
 
-int parse_and_run(int argc, const char* const* argv, context& ctx) {
-  const auto app = make_application(ctx);
+int parse_and_run(CLI::App& app, int argc, const char* const* argv, const context& ctx) {
   if (argc < 2) {
-    fmt::print(stderr, "{}", app->help());
+    complain(app.help());
     return exit_usage;
   }
   try {
-    app->parse(argc, argv);
+    app.parse(argc, argv);
     return ctx.exit;
   } catch (const CLI::ParseError& stop) {
     if (stop.get_exit_code() == 0) {
-      return app->exit(stop);  // --help or --version
+      std::ostringstream text;  // --help or --version
+      (void)app.exit(stop, text, text);
+      print(text.str());
+      return exit_done;
     }
-    if (const auto rest = app->remaining(); app->get_subcommands().empty() && !rest.empty()) {
+    if (const auto rest = app.remaining(); app.get_subcommands().empty() && !rest.empty()) {
       throw usage_error(fmt::format("there is no sub-command '{}'", rest.front()), "see kmctl --help");
     }
-    const auto chosen = app->get_subcommands();
+    const auto chosen = app.get_subcommands();
     const std::string command = chosen.empty() ? "kmctl" : "kmctl " + chosen.front()->get_name();
     throw usage_error(stop.what(), "see " + command + " --help");
   }
@@ -108,16 +115,21 @@ std::unique_ptr<CLI::App> make_application(context& ctx) {
 }
 
 int run(int argc, const char* const* argv) noexcept {
+  prepare_streams();
   context ctx;
+  std::unique_ptr<CLI::App> app;  // knows where the data goes, so it is needed to tell of a failure
   try {
     ctx.json_output = asks_for_json(argc, argv);
-    return parse_and_run(argc, argv, ctx);
+    app = make_application(ctx);
+    return parse_and_run(*app, argc, argv, ctx);
   } catch (const std::exception& failed) {
+    const int code = exit_code_of(failed);
     try {
-      return tell_failure(ctx, failed);
+      tell_failure(ctx, failed);
     } catch (const std::exception&) {
-      return exit_failure;  // not even the message could be written
+      complain("kmctl: out of memory\n");  // there is none to put the message together
     }
+    return code;
   }
 }
 

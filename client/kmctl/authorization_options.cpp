@@ -9,6 +9,7 @@
 
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/files.h"
+#include "client/kmctl/operation_parameters.h"
 #include "client/kmctl/values.h"
 #include "client/lib/names.h"
 
@@ -21,7 +22,8 @@ using client::authorizations;
 enum class value_kind { name, names, number, numbers, date, flag, file };
 
 constexpr unsigned for_keys = static_cast<unsigned>(option_use::generate) | static_cast<unsigned>(option_use::import);
-constexpr unsigned for_operations = static_cast<unsigned>(option_use::operation);
+constexpr unsigned for_ciphers = static_cast<unsigned>(option_use::cipher);
+constexpr unsigned for_operations = static_cast<unsigned>(option_use::operation) | for_ciphers;
 
 constexpr const char* group_kind = "Kind of key";
 constexpr const char* group_use = "What it may be used for";
@@ -65,9 +67,11 @@ constexpr std::array option_rows = std::to_array<option_row>({
     {"--user-auth-type", KM_TAG_USER_AUTH_TYPE, value_kind::name, for_keys, group_who, "how the user authenticates"},
     {"--auth-timeout", KM_TAG_AUTH_TIMEOUT, value_kind::number, for_keys, group_who,
      "seconds that an authentication lasts (default: one operation)"},
-    {"--digest", KM_TAG_DIGEST, value_kind::name, for_operations, group_operation, "digest"},
+    {"--block-mode", KM_TAG_BLOCK_MODE, value_kind::name, for_ciphers, group_operation, "block mode"},
     {"--padding", KM_TAG_PADDING, value_kind::name, for_operations, group_operation, "padding"},
-    {"--mac-length", KM_TAG_MAC_LENGTH, value_kind::number, for_operations, group_operation, "MAC length in bits"},
+    {"--digest", KM_TAG_DIGEST, value_kind::name, for_operations, group_operation, "digest"},
+    {"--mac-length", KM_TAG_MAC_LENGTH, value_kind::number, for_operations, group_operation,
+     "bits of a MAC or a GCM tag (default: all of them)"},
     {"--auth-token", KM_TAG_AUTH_TOKEN, value_kind::file, for_operations, group_operation,
      "file with the user's auth token"},
 });
@@ -134,7 +138,7 @@ void add_values(authorizations& out, const option_row& row, std::string_view tex
   add_value(out, row, std::string(text));
 }
 
-void add_row(CLI::App& command, const option_row& row, authorizations& out) {
+void add_row(CLI::App& command, const option_row& row, authorizations& out, std::vector<std::string>& files) {
   if (row.kind == value_kind::flag) {
     command
         .add_flag_callback(
@@ -143,47 +147,94 @@ void add_row(CLI::App& command, const option_row& row, authorizations& out) {
     return;
   }
   auto* const option = command.add_option_function<std::string>(
-      row.flag, [&row, &out](const std::string& text) { add_values(out, row, text); }, help_of(row));
+      row.flag,
+      [&row, &out, &files](const std::string& text) {
+        if (row.kind == value_kind::file) {
+          files.push_back(text);
+        }
+        add_values(out, row, text);
+      },
+      help_of(row));
   option->type_name(placeholder(row.kind))->group(row.group);
   if (is_list(row.kind)) {
     option->join(',');  // an option that is given again goes on with its list
   }
 }
 
-/// A new key of each algorithm, as far as its maker does not say otherwise.
+/// A new key of each algorithm, as far as its maker does not say otherwise: first its size, then what goes with what
+/// is known of its use.
 struct default_row {
   keymaster_algorithm_t algorithm;
   authorizations (*size)();
-  authorizations (*use)();
+  authorizations (*use)(const authorizations& given);
 };
 
+bool names_any(const authorizations& list, keymaster_tag_t tag, std::initializer_list<std::uint64_t> values) {
+  return std::ranges::any_of(list.numbers(tag),
+                             [&](std::uint64_t one) { return std::ranges::count(values, one) != 0; });
+}
+
+/// An RSA key signs, unless its purposes or its paddings say that it encrypts, or that it does both.
+authorizations rsa_use(const authorizations& given) {
+  const bool told = given.contains(KM_TAG_PURPOSE);
+  const bool pads_texts = names_any(given, KM_TAG_PADDING, {KM_PAD_RSA_OAEP, KM_PAD_RSA_PKCS1_1_5_ENCRYPT});
+  const bool pads_signatures =
+      names_any(given, KM_TAG_PADDING, {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN});
+  const bool signs =
+      told ? names_any(given, KM_TAG_PURPOSE, {KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY}) : pads_signatures || !pads_texts;
+  const bool encrypts = told ? names_any(given, KM_TAG_PURPOSE, {KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT}) : pads_texts;
+  authorizations use;
+  if (signs) {
+    use.purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY});
+  }
+  if (encrypts) {
+    use.purpose({KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT});
+  }
+  // Without a padding, and with this one, there is nothing to digest: a digest would make such a key unusable.
+  const auto padding = given.unique_number(KM_TAG_PADDING);
+  const bool bare = padding == KM_PAD_NONE || padding == KM_PAD_RSA_PKCS1_1_5_ENCRYPT;
+  use.digest({bare ? KM_DIGEST_NONE : KM_DIGEST_SHA_2_256});
+  if (signs) {
+    use.padding({KM_PAD_RSA_PKCS1_1_5_SIGN});
+  }
+  if (encrypts) {
+    use.padding({KM_PAD_RSA_OAEP});
+  }
+  return use;
+}
+
+authorizations ec_use(const authorizations& /*given*/) {
+  return authorizations{}.purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY}).digest({KM_DIGEST_SHA_2_256});
+}
+
+/// The paddings follow the block modes: a text of any length must have a way through each of them.
+authorizations aes_use(const authorizations& given) {
+  const bool chosen = given.contains(KM_TAG_BLOCK_MODE);
+  const bool gcm = !chosen || names_any(given, KM_TAG_BLOCK_MODE, {KM_MODE_GCM});
+  authorizations use = authorizations{}.purpose({KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT}).block_mode({KM_MODE_GCM});
+  if (gcm || names_any(given, KM_TAG_BLOCK_MODE, {KM_MODE_CTR})) {
+    use.padding({KM_PAD_NONE});
+  }
+  if (names_any(given, KM_TAG_BLOCK_MODE, {KM_MODE_ECB, KM_MODE_CBC})) {
+    use.padding({KM_PAD_PKCS7});
+  }
+  return gcm ? use.min_mac_length(128) : use;
+}
+
+/// A MAC is as long as its digest.
+authorizations hmac_use(const authorizations& given) {
+  const std::uint64_t digest = given.unique_number(KM_TAG_DIGEST).value_or(KM_DIGEST_SHA_2_256);
+  return authorizations{}
+      .purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY})
+      .digest({KM_DIGEST_SHA_2_256})
+      .min_mac_length(digest_bits(digest));
+}
+
 constexpr std::array default_rows = std::to_array<default_row>({
-    {KM_ALGORITHM_RSA, [] { return authorizations{}.key_size(2048).rsa_public_exponent(65537); },
-     [] {
-       return authorizations{}
-           .purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY})
-           .digest({KM_DIGEST_SHA_2_256})
-           .padding({KM_PAD_RSA_PKCS1_1_5_SIGN});
-     }},
-    {KM_ALGORITHM_EC, [] { return authorizations{}.key_size(256); },
-     [] {
-       return authorizations{}.purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY}).digest({KM_DIGEST_SHA_2_256});
-     }},
-    {KM_ALGORITHM_AES, [] { return authorizations{}.key_size(256); },
-     [] {
-       return authorizations{}
-           .purpose({KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT})
-           .block_mode({KM_MODE_GCM})
-           .padding({KM_PAD_NONE})
-           .min_mac_length(128);
-     }},
-    {KM_ALGORITHM_HMAC, [] { return authorizations{}.key_size(256); },
-     [] {
-       return authorizations{}
-           .purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY})
-           .digest({KM_DIGEST_SHA_2_256})
-           .min_mac_length(256);
-     }},
+    {KM_ALGORITHM_RSA, [] { return authorizations{}.key_size(2048).rsa_public_exponent(65537); }, rsa_use},
+    {KM_ALGORITHM_EC, [] { return authorizations{}.key_size(256); }, ec_use},
+    {KM_ALGORITHM_AES, [] { return authorizations{}.key_size(256); }, aes_use},
+    {KM_ALGORITHM_HMAC, [] { return authorizations{}.key_size(256); }, hmac_use},
 });
 
 void add_missing(authorizations& to, const authorizations& given, const authorizations& defaults) {
@@ -194,46 +245,12 @@ void add_missing(authorizations& to, const authorizations& given, const authoriz
   }
 }
 
-/// What begin must be told for a key of each algorithm, and the values that count for a signature.
-struct choice_row {
-  keymaster_algorithm_t algorithm;
-  keymaster_tag_t tag;
-  std::array<std::uint32_t, 3> candidates;  ///< all zero: any value
-};
-constexpr std::array choice_rows = std::to_array<choice_row>({
-    {KM_ALGORITHM_RSA, KM_TAG_PADDING, {KM_PAD_NONE, KM_PAD_RSA_PSS, KM_PAD_RSA_PKCS1_1_5_SIGN}},
-    {KM_ALGORITHM_RSA, KM_TAG_DIGEST, {}},
-    {KM_ALGORITHM_EC, KM_TAG_DIGEST, {}},
-});
-
-std::uint64_t only_choice(const choice_row& row, const authorizations& characteristics) {
-  std::vector<std::uint64_t> left;
-  for (const std::uint64_t value : characteristics.numbers(row.tag)) {
-    const bool counts = row.candidates == std::array<std::uint32_t, 3>{} ||
-                        std::ranges::find(row.candidates, value) != row.candidates.end();
-    if (counts && std::ranges::find(left, value) == left.end()) {
-      left.push_back(value);
-    }
-  }
-  if (left.size() == 1) {
-    return left.front();
-  }
-  const client::tag_name* const tag = client::find_tag(row.tag);
-  std::string choices;
-  for (const std::uint64_t value : left) {
-    choices += (choices.empty() ? "" : ", ") + client::name_of(tag->values, value);
-  }
-  throw usage_error(left.empty() ? fmt::format("the key names no {} that could be used", tag->name)
-                                 : fmt::format("the key allows more than one {}: {}", tag->name, choices),
-                    fmt::format("say which one with --{}", tag->name));
-}
-
 }  // namespace
 
 void authorization_options::add_to(CLI::App& command, option_use use) {
   for (const option_row& row : option_rows) {
     if ((row.uses & static_cast<unsigned>(use)) != 0) {
-      add_row(command, row, given_);
+      add_row(command, row, given_, files_);
     }
   }
 }
@@ -243,7 +260,14 @@ void application_options::add_to(CLI::App& command) {
   const auto add = [&](const char* flag, bytes& to, const char* help) {
     command
         .add_option_function<std::string>(
-            flag, [&to](const std::string& text) { to = parse_bytes(text); }, help)
+            flag,
+            [this, &to](const std::string& text) {
+              if (const auto file = file_of_value(text)) {
+                files_.push_back(*file);
+              }
+              to = parse_bytes(text);
+            },
+            help)
         ->type_name("VALUE")
         ->group(group);
   };
@@ -263,33 +287,10 @@ authorizations with_defaults(const authorizations& given, option_use use) {
     if (use == option_use::generate) {
       add_missing(all, given, row->size());
     }
-    // Raw RSA works on what the caller prepared; a digest would make such a key unusable.
-    const bool raw = given.unique_number(KM_TAG_PADDING) == KM_PAD_NONE && algorithm == KM_ALGORITHM_RSA;
-    if (raw && !given.contains(KM_TAG_DIGEST)) {
-      all.digest({KM_DIGEST_NONE});
-    }
-    add_missing(all, authorizations(all), row->use());
+    add_missing(all, given, row->use(given));
   }
   if (!given.contains(KM_TAG_USER_SECURE_ID) && !given.contains(KM_TAG_NO_AUTH_REQUIRED)) {
     all.no_auth_required();
-  }
-  return all;
-}
-
-authorizations operation_parameters(const authorizations& given, const authorizations& characteristics) {
-  authorizations all = given;
-  const auto algorithm = characteristics.unique_number(KM_TAG_ALGORITHM);
-  for (const choice_row& row : choice_rows) {
-    if (row.algorithm != algorithm || all.contains(row.tag)) {
-      continue;
-    }
-    const bool raw = row.tag == KM_TAG_DIGEST && all.unique_number(KM_TAG_PADDING) == KM_PAD_NONE;
-    all.add(row.tag, raw ? std::uint64_t{KM_DIGEST_NONE} : only_choice(row, characteristics));
-  }
-  if (algorithm == KM_ALGORITHM_HMAC && !all.contains(KM_TAG_MAC_LENGTH)) {
-    if (const auto shortest = characteristics.unique_number(KM_TAG_MIN_MAC_LENGTH)) {
-      all.add(KM_TAG_MAC_LENGTH, *shortest);
-    }
   }
   return all;
 }

@@ -4,14 +4,15 @@
 
 #include <CLI/CLI.hpp>
 #include <string>
+#include <vector>
 
 #include "client/lib/authorizations.h"
 #include "client/lib/keys.h"
 
 namespace kmctl {
 
-/// Where an option is offered.
-enum class option_use : unsigned { generate = 1, import = 2, operation = 4 };
+/// Where an option is offered: on keys that are made or imported, on signatures and MACs, on ciphers.
+enum class option_use : unsigned { generate = 1, import = 2, operation = 4, cipher = 8 };
 
 /// Collects --algorithm, --digest, --usage-expire and their like into authorizations.
 class authorization_options {
@@ -21,9 +22,12 @@ class authorization_options {
 
   /// What was given, in the order of the options' table.
   [[nodiscard]] const keymaster::client::authorizations& given() const { return given_; }
+  /// The files that it came from.
+  [[nodiscard]] const std::vector<std::string>& files() const { return files_; }
 
  private:
   keymaster::client::authorizations given_;
+  std::vector<std::string> files_;
 };
 
 /// Collects --app-id and --app-data.
@@ -31,21 +35,20 @@ class application_options {
  public:
   void add_to(CLI::App& command);
   [[nodiscard]] const keymaster::client::application& given() const { return given_; }
+  /// The files that it came from.
+  [[nodiscard]] const std::vector<std::string>& files() const { return files_; }
 
  private:
   keymaster::client::application given_;
+  std::vector<std::string> files_;
 };
 
 /// with_defaults completes the description of a new key: what `given` leaves out is filled with what suits its
-/// algorithm (RSA when it names none), so that an empty description is a sound key. A key that is imported brings its
-/// own size and exponent, which stay out. Without a user's id the key needs no authentication.
+/// algorithm (RSA when it names none) and the use that is known, so that an empty description is a sound key. A key
+/// that is imported brings its own size and exponent, which stay out. Without a user's id the key needs no
+/// authentication.
 [[nodiscard]] keymaster::client::authorizations with_defaults(const keymaster::client::authorizations& given,
                                                               option_use use);
-
-/// operation_parameters gives what begin needs for a key with these characteristics: the given padding, digest and MAC
-/// length, and where one is missing the only one that the key allows. Throws usage_error when there is a choice.
-[[nodiscard]] keymaster::client::authorizations operation_parameters(
-    const keymaster::client::authorizations& given, const keymaster::client::authorizations& characteristics);
 
 }  // namespace kmctl
 

@@ -3,13 +3,16 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <system_error>
+#include <string>
+#include <vector>
 
 #include "client/kmctl/authorization_options.h"
 #include "client/kmctl/commands.h"
 #include "client/kmctl/describe.h"
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/files.h"
+#include "client/kmctl/output_file.h"
+#include "client/kmctl/system_failure.h"
 #include "client/kmctl/values.h"
 #include "client/lib/key_material.h"
 
@@ -59,19 +62,22 @@ struct export_options {
   sealed_key key;
   std::string out = "-";
   bool der = false;
+  CLI::Option* data_option = nullptr;
 
   void add_to(CLI::App& command) {
     key.add_to(command);
-    command.add_option("-o,--output", out, "file for the public key (default: standard output)")->type_name("FILE");
+    data_option = command.add_option("-o,--output", out, "file for the public key (default: standard output)");
+    data_option->type_name("FILE");
     command.add_flag("--der", der, "DER in place of PEM");
     command.footer(export_examples);
   }
 };
 
 int run_export(const export_options& options, const context& ctx) {
-  if (same_file(options.out, options.key.path)) {
-    throw usage_error("the public key would overwrite the key blob");
-  }
+  std::vector<std::string> inputs = options.key.app.files();
+  inputs.push_back(options.key.path);
+  refuse_overwriting(options.out, inputs);
+  (options.der ? check_binary_output : check_output)(options.out, {});
   const bytes blob = options.key.read();
   tee_link tee(ctx);
   const authorizations characteristics = client::get_characteristics(tee.ta(), blob, options.key.app.given());
@@ -80,15 +86,12 @@ int run_export(const export_options& options, const context& ctx) {
   const bytes exported = client::export_key(tee.ta(), blob, options.key.app.given());
   if (options.der) {
     write_binary(options.out, client::public_key_der(algorithm, exported), {});
-  } else if (const std::string pem = client::public_key_pem(algorithm, exported); options.out == "-") {
-    fmt::print("{}", pem);
   } else {
-    write_file(options.out, client::as_bytes(pem), {});
+    write_file(options.out, client::as_bytes(client::public_key_pem(algorithm, exported)), {});
   }
   if (options.out != "-" || ctx.json_output) {
     tell(ctx, fmt::format("Public part of the {} key in {}", key_title(characteristics), options.out),
-         {{"output", options.out}, {"format", options.der ? "der" : "pem"}, {"key", key_title(characteristics)}},
-         options.out);
+         {{"output", options.out}, {"format", options.der ? "der" : "pem"}, {"key", key_title(characteristics)}});
   }
   return exit_done;
 }
@@ -124,13 +127,18 @@ struct delete_options {
 
 int run_delete(const delete_options& options, const context& ctx) {
   if (options.path == "-") {
-    throw usage_error("only a file can be deleted");
+    throw usage_error("only a file can be deleted", "name the blob's file");
   }
-  const bytes blob = read_small_file(options.path, "key blob");
+  input_file file(options.path);
+  const bytes blob = read_small_file(file, "key blob");
   tee_link tee(ctx);
   client::delete_key(tee.ta(), blob);
+  if (!file.still_named()) {
+    throw failure_error(fmt::format("{} is another file now, and was not removed", options.path),
+                        "look at it, and delete it if you mean it");
+  }
   if (::unlink(options.path.c_str()) != 0) {
-    throw failure_error(fmt::format("can't remove {}: {}", options.path, std::generic_category().message(errno)));
+    refuse_file("remove", options.path, errno);
   }
   tell(ctx, fmt::format("The TA agreed, and {} is removed. Copies of it would still work.", options.path),
        {{"deleted", options.path}});

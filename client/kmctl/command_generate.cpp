@@ -3,12 +3,14 @@
 
 #include <chrono>
 #include <optional>
+#include <vector>
 
 #include "client/kmctl/authorization_options.h"
 #include "client/kmctl/commands.h"
 #include "client/kmctl/describe.h"
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/files.h"
+#include "client/kmctl/output_file.h"
 #include "client/kmctl/progress.h"
 #include "client/kmctl/values.h"
 #include "client/lib/key_material.h"
@@ -20,35 +22,53 @@ namespace client = keymaster::client;
 using client::authorizations;
 
 constexpr const char* generate_examples =
-    "What is left out is filled in: an RSA-2048 key for PKCS#1 v1.5 signatures over SHA-256.\n"
+    "What is left out is filled in: an RSA-2048 key for PKCS#1 v1.5 signatures over SHA-256, or with --algorithm an "
+    "EC\n"
+    "key on P-256 (--size chooses the curve), an AES-256 key for gcm, a 256-bit HMAC key for SHA-256. An RSA key "
+    "encrypts\n"
+    "when its purposes or paddings say so.\n"
     "Dates are ISO 8601, UTC without an offset: 2030-01-31, 2030-01-31T12:00:00+02:00.\n\n"
     "Examples:\n"
     "  kmctl generate key.blob\n"
     "  kmctl generate --size 4096 --padding pss --digest sha-256,sha-512 key.blob\n"
+    "  kmctl generate --padding oaep rsa.blob\n"
+    "  kmctl generate --algorithm ec --size 384 --digest sha-384 ec.blob\n"
+    "  kmctl generate --algorithm aes --block-mode cbc,ctr aes.blob\n"
+    "  kmctl generate --algorithm hmac --min-mac-length 128 hmac.blob\n"
     "  kmctl generate --app-id my.app --app-data hex:00ff17 key.blob\n"
     "  kmctl generate --active 2030-01-01 --origination-expire 2031-01-01 key.blob\n"
     "  kmctl generate - > key.blob\n";
 
 constexpr const char* import_examples =
-    "FILE is a private key as openssl writes it: PEM or DER, PKCS#8 or PKCS#1, encrypted or not. Raw keys (AES, HMAC)\n"
-    "are taken as they stand when --algorithm names such an algorithm. Size and exponent are those of the key.\n\n"
+    "FILE is a private RSA or EC key as openssl writes it: PEM or DER, PKCS#8, PKCS#1 or SEC 1, encrypted or not. "
+    "With\n"
+    "--algorithm aes or hmac its bytes are the key. Size and exponent are those of the key.\n\n"
     "Examples:\n"
     "  openssl genrsa -out private.pem 2048\n"
     "  kmctl import private.pem key.blob\n"
+    "  kmctl import --algorithm aes --block-mode cbc raw.key aes.blob\n"
     "  kmctl import --passphrase @secret.txt --padding pss encrypted.pem key.blob\n";
 
 constexpr mode_t blob_mode = 0600;
 
+/// The blob is the only copy of its key, and only its owner can read it.
 struct blob_output {
   std::string path;
   bool force = false;
 
-  void add_to(CLI::App& command) {
-    command.add_option("BLOB", path, "file for the sealed blob, - for standard output")->required()->type_name("");
+  CLI::Option* add_to(CLI::App& command) {
     command.add_flag("--force", force, "overwrite an existing file");
+    return command.add_option("BLOB", path, "file for the sealed blob, - for standard output")
+        ->required()
+        ->type_name("");
   }
   [[nodiscard]] output_rules rules() const {
     return {.existing = force ? overwrite::always : overwrite::never, .mode = blob_mode};
+  }
+  void check(std::vector<std::string> inputs, const application_options& app) const {
+    inputs.insert(inputs.end(), app.files().begin(), app.files().end());
+    refuse_overwriting(path, inputs);
+    check_binary_output(path, rules());
   }
 };
 
@@ -56,11 +76,12 @@ struct generate_options {
   authorization_options description;
   application_options app;
   blob_output out;
+  CLI::Option* data_option = nullptr;
 
   void add_to(CLI::App& command) {
     description.add_to(command, option_use::generate);
     app.add_to(command);
-    out.add_to(command);
+    data_option = out.add_to(command);
     command.footer(generate_examples);
   }
 };
@@ -71,12 +92,13 @@ struct import_options {
   blob_output out;
   std::string file;
   std::optional<std::string> passphrase;
+  CLI::Option* data_option = nullptr;
 
   void add_to(CLI::App& command) {
     description.add_to(command, option_use::import);
     app.add_to(command);
     command.add_option("FILE", file, "private key, - for standard input")->required()->type_name("");
-    out.add_to(command);
+    data_option = out.add_to(command);
     command
         .add_option("--passphrase", passphrase, "of an encrypted key: @FILE, or as it stands (others can see it there)")
         ->type_name("VALUE");
@@ -94,12 +116,11 @@ void tell_key(const context& ctx, const char* done, const std::string& path, con
        {{"blob", path},
         {"size", blob.size()},
         {"seconds", seconds},
-        {"characteristics", describe_json(characteristics)}},
-       path);
+        {"characteristics", describe_json(characteristics)}});
 }
 
 int run_generate(const generate_options& options, const context& ctx) {
-  check_output(options.out.path, options.out.rules());
+  options.out.check({}, options.app);
   authorizations description = with_defaults(options.description.given(), option_use::generate);
   const std::string title = key_title(description);
   description.add(options.app.given().tags());
@@ -122,16 +143,29 @@ bool is_raw(std::uint64_t algorithm) {
   return algorithm == keymaster::KM_ALGORITHM_AES || algorithm == keymaster::KM_ALGORITHM_HMAC;
 }
 
-/// The passphrase of the command line; a file's last line end does not belong to it.
-std::optional<std::string> passphrase_of(const import_options& options) {
+/// The passphrase of an encrypted key. A file's last line end does not belong to it.
+std::optional<secret_bytes> passphrase_of(const import_options& options) {
   if (!options.passphrase) {
     return std::nullopt;
   }
-  std::string text(client::as_text(parse_bytes(*options.passphrase)));
-  while (options.passphrase->starts_with("@") && (text.ends_with('\n') || text.ends_with('\r'))) {
+  const auto file = file_of_value(*options.passphrase);
+  if (!file) {
+    const bytes typed = parse_bytes(*options.passphrase);  // it lies open in the command line anyway
+    return secret_bytes(typed.begin(), typed.end());
+  }
+  secret_bytes text = read_secret_file(*file, "passphrase");
+  while (!text.empty() && (text.back() == '\n' || text.back() == '\r')) {
     text.pop_back();
   }
   return text;
+}
+
+std::vector<std::string> files_of(const import_options& options) {
+  std::vector<std::string> files{options.file};
+  if (const auto file = file_of_value(options.passphrase.value_or(""))) {
+    files.push_back(*file);
+  }
+  return files;
 }
 
 /// Gives the key's material, and adds the algorithm to the description when only the file told it.
@@ -141,7 +175,8 @@ secret_bytes material_of(const import_options& options, authorizations& descript
   if (is_raw(stated.value_or(0))) {
     return file;
   }
-  auto key = client::read_private_key(file, passphrase_of(options));
+  const auto passphrase = passphrase_of(options);
+  auto key = client::read_private_key(file, passphrase ? std::optional(client::as_text(*passphrase)) : std::nullopt);
   if (!stated) {
     description.algorithm(key.algorithm);
   } else if (*stated != key.algorithm) {
@@ -151,7 +186,7 @@ secret_bytes material_of(const import_options& options, authorizations& descript
 }
 
 int run_import(const import_options& options, const context& ctx) {
-  check_output(options.out.path, options.out.rules());
+  options.out.check(files_of(options), options.app);
   authorizations given = options.description.given();
   const secret_bytes material = material_of(options, given);
   authorizations description = with_defaults(given, option_use::import);

@@ -1,33 +1,34 @@
 // kmctl sign and kmctl verify: files of any size, streamed through the TA.
 #include <fmt/format.h>
 
-#include <algorithm>
-#include <initializer_list>
+#include <string>
+#include <vector>
 
 #include "client/kmctl/authorization_options.h"
 #include "client/kmctl/commands.h"
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/files.h"
+#include "client/kmctl/output_file.h"
 #include "client/kmctl/signing.h"
 #include "client/kmctl/values.h"
-#include "client/lib/names.h"
 
 namespace kmctl {
 namespace {
 
 namespace client = keymaster::client;
-using client::authorizations;
 
 constexpr const char* sign_examples =
-    "Padding and digest are those of the key when it allows only one of each.\n\n"
+    "Padding and digest are those of the key when it allows only one of each. An HMAC key makes a MAC, as long as its\n"
+    "digest unless --mac-length says less; an EC signature is the DER that openssl takes.\n\n"
     "Examples:\n"
     "  kmctl sign key.blob letter.txt -o letter.sig\n"
     "  kmctl sign key.blob < letter.txt > letter.sig\n"
     "  kmctl sign --padding pss --digest sha-512 key.blob letter.txt -o letter.sig\n"
+    "  kmctl sign hmac.blob letter.txt -o letter.mac\n"
     "  tar c folder | kmctl sign key.blob - -o folder.sig\n";
 
 constexpr const char* verify_examples =
-    "Exits with 0 when the signature belongs to the file and the key, with 6 when it does not.\n\n"
+    "Exits with 0 when the signature or MAC belongs to the file and the key, with 6 when it does not.\n\n"
     "Examples:\n"
     "  kmctl verify key.blob letter.sig letter.txt\n"
     "  kmctl verify key.blob letter.sig < letter.txt\n"
@@ -39,6 +40,12 @@ struct signing_options {
   application_options app;
   authorization_options parameters;
 
+  [[nodiscard]] std::vector<std::string> inputs() const {
+    std::vector<std::string> all{blob, file};
+    all.insert(all.end(), app.files().begin(), app.files().end());
+    all.insert(all.end(), parameters.files().begin(), parameters.files().end());
+    return all;
+  }
   void add_blob_to(CLI::App& command) {
     command.add_option("BLOB", blob, "sealed key, - for standard input")->required()->type_name("");
   }
@@ -51,11 +58,13 @@ struct signing_options {
 
 struct sign_options : signing_options {
   std::string out = "-";
+  CLI::Option* data_option = nullptr;
 
   void add_to(CLI::App& command) {
     add_blob_to(command);
     add_rest_to(command);
-    command.add_option("-o,--output", out, "file for the signature (default: standard output)")->type_name("FILE");
+    data_option = command.add_option("-o,--output", out, "file for the signature or MAC (default: standard output)");
+    data_option->type_name("FILE");
     command.footer(sign_examples);
   }
 };
@@ -65,57 +74,37 @@ struct verify_options : signing_options {
 
   void add_to(CLI::App& command) {
     add_blob_to(command);
-    command.add_option("SIGNATURE", signature, "the signature, - for standard input")->required()->type_name("");
+    command.add_option("SIGNATURE", signature, "the signature or MAC, - for standard input")->required()->type_name("");
     add_rest_to(command);
     command.footer(verify_examples);
   }
 };
 
-void refuse_shared_input(std::initializer_list<const std::string*> inputs) {
-  if (std::ranges::count(inputs, "-", [](const std::string* path) { return *path; }) > 1) {
-    throw usage_error("only one input can come from standard input");
-  }
+key_use use_of(const signing_options& options, client::session& ta, keymaster::keymaster_purpose_t purpose,
+               byte_view blob) {
+  return make_key_use(ta, purpose, blob, options.app.given(), options.parameters.given());
 }
 
-/// The key of a command, its own parameters completed by what its characteristics leave open.
-signing_key key_of(const signing_options& options, client::session& ta, byte_view blob) {
-  signing_key key{.blob = blob, .app = options.app.given(), .parameters = {}, .each_step = {}};
-  const authorizations characteristics = client::get_characteristics(ta, blob, key.app);
-  key.parameters = operation_parameters(options.parameters.given(), characteristics);
-  for (const client::authorization& one : key.parameters) {
-    if (one.tag == keymaster::KM_TAG_AUTH_TOKEN) {
-      key.each_step.auth_token(one.blob);
-    }
-  }
-  return key;
-}
-
-std::string parameter_name(const authorizations& list, keymaster::keymaster_tag_t tag) {
-  const auto value = list.unique_number(tag);
-  return value ? client::name_of(client::find_tag(tag)->values, *value) : "none";
-}
-
-json parameters_json(const signing_key& key) {
-  return {{"padding", parameter_name(key.parameters, keymaster::KM_TAG_PADDING)},
-          {"digest", parameter_name(key.parameters, keymaster::KM_TAG_DIGEST)}};
+/// What a key of its algorithm makes.
+const char* noun_of(const key_use& key) {
+  return key.algorithm == keymaster::KM_ALGORITHM_HMAC ? "MAC" : "Signature";
 }
 
 int run_sign(const sign_options& options, const context& ctx) {
   refuse_shared_input({&options.blob, &options.file});
-  if (same_file(options.out, options.blob) || same_file(options.out, options.file)) {
-    throw usage_error("the signature would overwrite an input");
-  }
+  refuse_overwriting(options.out, options.inputs());
+  check_binary_output(options.out, {});
   const bytes blob = read_small_file(options.blob, "key blob");
   input_file data(options.file);
   tee_link tee(ctx);
-  const signing_key key = key_of(options, tee.ta(), blob);
+  const key_use key = use_of(options, tee.ta(), keymaster::KM_PURPOSE_SIGN, blob);
   const bytes signature = sign_stream(tee.ta(), key, data_of(data));
   write_binary(options.out, signature, {});
   json object = {{"signature", options.out}, {"size", signature.size()}};
   object.update(parameters_json(key));
-  const std::string text = fmt::format("Signature of {} in {} ({}, {})", format_size(signature.size()), options.out,
-                                       object["padding"].get<std::string>(), object["digest"].get<std::string>());
-  tell(ctx, options.out == "-" ? std::string{} : text, object, options.out);
+  const std::string text = fmt::format("{} of {} in {} ({})", noun_of(key), format_size(signature.size()), options.out,
+                                       parameters_text(key));
+  tell(ctx, options.out == "-" ? std::string{} : text, object);
   return exit_done;
 }
 
@@ -125,7 +114,7 @@ int run_verify(const verify_options& options, const context& ctx) {
   const bytes signature = read_small_file(options.signature, "signature");
   input_file data(options.file);
   tee_link tee(ctx);
-  const signing_key key = key_of(options, tee.ta(), blob);
+  const key_use key = use_of(options, tee.ta(), keymaster::KM_PURPOSE_VERIFY, blob);
   json object = {{"valid", true}};
   object.update(parameters_json(key));
   try {
@@ -136,13 +125,10 @@ int run_verify(const verify_options& options, const context& ctx) {
     }
     object["valid"] = false;
     object["error"] = failure_json(refused);
-    tell(ctx, {}, object);
+    tell_failure_json(ctx, object);
     return exit_invalid;
   }
-  tell(ctx,
-       fmt::format("Signature valid ({}, {})", object["padding"].get<std::string>(),
-                   object["digest"].get<std::string>()),
-       object);
+  tell(ctx, fmt::format("{} valid ({})", noun_of(key), parameters_text(key)), object);
   return exit_done;
 }
 

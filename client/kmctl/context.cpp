@@ -1,16 +1,17 @@
 #include "client/kmctl/context.h"
 
 #include <fmt/format.h>
-#include <pwd.h>
-#include <unistd.h>
 
 #include <cstdlib>
 #include <filesystem>
-#include <optional>
+#include <system_error>
 
+#include "client/kmctl/console.h"
 #include "client/kmctl/exit_codes.h"
+#include "client/kmctl/system_failure.h"
 #include "client/lib/names.h"
 #include "src/params/keymaster_defs.h"
+#include "tee/client/default_folder.h"
 
 namespace kmctl {
 namespace {
@@ -19,23 +20,11 @@ namespace fs = std::filesystem;
 using keymaster::client::error;
 using keymaster::client::error_kind;
 
-std::optional<std::string> environment(const char* name) {
-  const char* const value = std::getenv(name);
-  return value == nullptr || *value == '\0' ? std::nullopt : std::optional<std::string>(value);
-}
-
 fs::path default_state() {
-  if (const auto base = environment("XDG_STATE_HOME"); base && fs::path(*base).is_absolute()) {
-    return fs::path(*base) / "keymaster";
+  if (const auto folder = hosted_tee::default_state_folder()) {
+    return *folder;
   }
-  if (const auto home = environment("HOME")) {
-    return fs::path(*home) / ".local" / "state" / "keymaster";
-  }
-  const passwd* const user = ::getpwuid(::getuid());
-  if (user == nullptr || user->pw_dir == nullptr) {
-    throw failure_error("there is no home folder to keep the device's state in", "name a folder with --state");
-  }
-  return fs::path(user->pw_dir) / ".local" / "state" / "keymaster";
+  throw failure_error("there is no home folder to keep the device's state in", "name a folder with --state");
 }
 
 std::string embedded(const fs::path& state) {
@@ -57,7 +46,14 @@ std::string hint_of(const std::exception& failed) {
   if (const auto* const failure = dynamic_cast<const failure_error*>(&failed)) {
     return failure->hint();
   }
+  if (const auto* const of_system = dynamic_cast<const std::system_error*>(&failed)) {
+    return advice_on(of_system->code().value());
+  }
   return {};
+}
+
+bool data_takes_stdout(const context& ctx) {
+  return ctx.data_on_stdout && ctx.data_on_stdout();
 }
 
 }  // namespace
@@ -69,23 +65,23 @@ std::string tee_name(const context& ctx) {
   if (!ctx.state.empty()) {
     return embedded(ctx.state);
   }
-  if (const auto name = environment("KEYMASTER_TEE")) {
-    return *name;
-  }
-  if (const auto folder = environment("KEYMASTER_STATE")) {
-    return embedded(*folder);
+  if (const char* const name = std::getenv("KEYMASTER_TEE"); name != nullptr && *name != '\0') {
+    return name;
   }
   return embedded(default_state());
 }
 
 tee_link::tee_link(const context& ctx) : name_(tee_name(ctx)), connection_(name_), session_(connection_) {}
 
-void tell(const context& ctx, const std::string& text, const json& object, const std::string& data_path) {
-  std::FILE* const out = data_path == "-" ? stderr : stdout;
-  if (ctx.json_output) {
-    fmt::print(out, "{}\n", dump(object));
-  } else if (!text.empty()) {
-    fmt::print(out, "{}\n", text);
+void tell(const context& ctx, const std::string& text, const json& object) {
+  const std::string told = ctx.json_output ? dump(object) : text;
+  if (told.empty()) {
+    return;
+  }
+  if (data_takes_stdout(ctx)) {
+    complain(told + "\n");
+  } else {
+    print(told + "\n");
   }
 }
 
@@ -120,16 +116,22 @@ json failure_json(const std::exception& failed) {
   return object;
 }
 
-int tell_failure(const context& ctx, const std::exception& failed) {
-  if (ctx.json_output) {
-    fmt::print(stdout, "{}\n", dump({{"error", failure_json(failed)}}));
-  } else {
-    fmt::print(stderr, "kmctl: {}\n", failed.what());
-    if (const std::string hint = hint_of(failed); !hint.empty()) {
-      fmt::print(stderr, "  hint: {}\n", hint);
-    }
+void tell_failure_json(const context& ctx, const json& object) {
+  try {
+    tell(ctx, {}, object);
+  } catch (const failure_error&) {
+    complain(dump(object) + "\n");
   }
-  return exit_code_of(failed);
+}
+
+void tell_failure(const context& ctx, const std::exception& failed) {
+  if (ctx.json_output) {
+    tell_failure_json(ctx, {{"error", failure_json(failed)}});
+    return;
+  }
+  const std::string hint = hint_of(failed);
+  complain(
+      fmt::format("kmctl: {}\n{}", failed.what(), hint.empty() ? std::string{} : fmt::format("  hint: {}\n", hint)));
 }
 
 }  // namespace kmctl

@@ -3,6 +3,7 @@
 #define KEYMASTER_CLIENT_KMCTL_CONTEXT_H_
 
 #include <exception>
+#include <functional>
 #include <nlohmann/json.hpp>
 #include <string>
 
@@ -18,6 +19,7 @@ struct context {
   std::string state;  ///< --state FOLDER
   bool json_output = false;
   int exit = 0;
+  std::function<bool()> data_on_stdout;  ///< whether the command's data goes to standard output; empty: it has none
 };
 
 /// tee_name chooses the TEE: --tee, --state, the environment's KEYMASTER_TEE, its KEYMASTER_STATE, and last the folder
@@ -39,12 +41,17 @@ class tee_link {
 };
 
 /// tell prints a command's result, as text or as one JSON object: to standard output, or to standard error when the
-/// command's data goes to standard output (`data_path` is "-"). An empty text prints nothing.
-void tell(const context& ctx, const std::string& text, const json& object, const std::string& data_path = {});
+/// command's data goes to standard output. An empty text prints nothing. Throws failure_error when standard output
+/// doesn't take it.
+void tell(const context& ctx, const std::string& text, const json& object);
 
-/// tell_failure prints what went wrong, and what to try, to standard error (with --json as an object to standard
-/// output), and gives the exit code that stands for it.
-int tell_failure(const context& ctx, const std::exception& failed);
+/// tell_failure prints what went wrong, and what to try, to standard error. With --json it is an object, and goes where
+/// a result would go.
+void tell_failure(const context& ctx, const std::exception& failed);
+
+/// tell_failure_json prints such an object. Standard error gets what standard output doesn't take: the failure and its
+/// exit code come before that.
+void tell_failure_json(const context& ctx, const json& object);
 
 /// failure_json gives the same as an object, for commands that tell more beside it.
 [[nodiscard]] json failure_json(const std::exception& failed);

@@ -15,7 +15,7 @@ enum exit_code : int {
   exit_tee_error = 3,      ///< the TEE or the TA did not carry out the request
   exit_keymaster = 4,      ///< the TA carried it out and refused
   exit_no_connection = 5,  ///< no TEE, or no session with the TA
-  exit_invalid = 6,        ///< a signature or MAC does not belong to the data
+  exit_invalid = 6,        ///< a signature, MAC or tag does not belong to the data
 };
 
 /// The codes as `kmctl --help` lists them.
@@ -27,7 +27,7 @@ inline constexpr const char* exit_code_help =
     "  3  TEE error: the request was not carried out\n"
     "  4  Keymaster error: the request was carried out and refused\n"
     "  5  no connection to a TEE, or no session with the Keymaster TA\n"
-    "  6  signature or MAC invalid\n";
+    "  6  signature, MAC or tag invalid\n";
 
 /// The command line doesn't make sense. `hint` says what would.
 class usage_error : public std::runtime_error {

@@ -5,116 +5,32 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
-#include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <system_error>
 #include <utility>
 
 #include "client/kmctl/exit_codes.h"
+#include "client/kmctl/system_failure.h"
 
 namespace kmctl {
 namespace {
 
 namespace fs = std::filesystem;
 
-[[noreturn]] void refuse(const std::string& doing, const std::string& path, int cause) {
-  throw failure_error(fmt::format("can't {} {}: {}", doing, path == "-" ? "standard input" : path,
-                                  std::generic_category().message(cause)));
-}
-
-[[noreturn]] void refuse_existing(const std::string& path) {
-  throw failure_error(fmt::format("{} exists already", path), "choose another name, or overwrite it with --force");
-}
-
-class descriptor {
- public:
-  explicit descriptor(int number) : number_(number) {}
-  descriptor(const descriptor&) = delete;
-  descriptor& operator=(const descriptor&) = delete;
-  ~descriptor() { reset(); }
-  [[nodiscard]] int get() const { return number_; }
-  int reset() { return number_ < 0 ? 0 : ::close(std::exchange(number_, -1)); }
-
- private:
-  int number_;
-};
-
-/// A file that vanishes unless it is released.
-class temporary_name {
- public:
-  explicit temporary_name(std::string path) : path_(std::move(path)) {}
-  temporary_name(const temporary_name&) = delete;
-  temporary_name& operator=(const temporary_name&) = delete;
-  ~temporary_name() {
-    if (!path_.empty()) {
-      (void)::unlink(path_.c_str());
-    }
-  }
-  [[nodiscard]] char* data() { return path_.data(); }
-  [[nodiscard]] const char* c_str() const { return path_.c_str(); }
-  void release() { path_.clear(); }
-
- private:
-  std::string path_;
-};
-
-void write_all(int out, byte_view content, const std::string& path) {
-  while (!content.empty()) {
-    const ssize_t written = ::write(out, content.data(), content.size());
-    if (written < 0 && errno != EINTR) {
-      refuse("write", path, errno);
-    }
-    content = content.subspan(written < 0 ? 0 : static_cast<std::size_t>(written));
-  }
-}
-
-void write_straight(const std::string& path, byte_view content) {
-  descriptor out(::open(path.c_str(), O_WRONLY | O_CLOEXEC | O_NOCTTY));
-  if (out.get() < 0) {
-    refuse("open", path, errno);
-  }
-  write_all(out.get(), content, path);
-}
-
-mode_t current_umask() {
-  const mode_t mask = ::umask(0);
-  ::umask(mask);
-  return mask;
-}
-
-/// Puts the complete file in its place. The kernel decides about an existing one, so that two writers can't both win.
-void put_in_place(temporary_name& temporary, const std::string& target, overwrite existing) {
-  if (existing == overwrite::always) {
-    if (::rename(temporary.c_str(), target.c_str()) != 0) {
-      refuse("write", target, errno);
-    }
-    temporary.release();
-    return;
-  }
-  if (::renameat2(AT_FDCWD, temporary.c_str(), AT_FDCWD, target.c_str(), RENAME_NOREPLACE) == 0) {
-    temporary.release();
-    return;
-  }
-  // Some file systems lack that call; a hard link does not replace anything either.
-  if (errno == EEXIST || ::link(temporary.c_str(), target.c_str()) != 0) {
-    if (errno == EEXIST) {
-      refuse_existing(target);
-    }
-    refuse("write", target, errno);
-  }
+[[noreturn]] void refuse(const char* doing, const std::string& path, int cause) {
+  refuse_file(doing, path == "-" ? "standard input" : path, cause);
 }
 
 template <class Bytes>
-Bytes read_whole(const std::string& path, const char* what) {
-  input_file in(path);
+Bytes read_whole(input_file& in, const char* what) {
   Bytes content(std::size_t{4096});
   std::size_t filled = 0;
   while (const std::size_t more = in.read(std::span(content).subspan(filled))) {
     filled += more;
     if (filled > small_file_limit) {
-      throw failure_error(fmt::format("{} is too large for a {}", path, what));
+      throw failure_error(fmt::format("{} is too large for a {}", in.path(), what), "check that it is the right file");
     }
     content.resize(filled * 2 + 4096);
   }
@@ -157,12 +73,25 @@ std::size_t input_file::read(std::span<std::uint8_t> buffer) {
   return filled;
 }
 
+bool input_file::still_named() const {
+  struct stat opened {};
+  struct stat named {};
+  return ::fstat(descriptor_, &opened) == 0 && ::stat(path_.c_str(), &named) == 0 && opened.st_dev == named.st_dev &&
+         opened.st_ino == named.st_ino;
+}
+
 bytes read_small_file(const std::string& path, const char* what) {
-  return read_whole<bytes>(path, what);
+  input_file in(path);
+  return read_whole<bytes>(in, what);
+}
+
+bytes read_small_file(input_file& file, const char* what) {
+  return read_whole<bytes>(file, what);
 }
 
 secret_bytes read_secret_file(const std::string& path, const char* what) {
-  return read_whole<secret_bytes>(path, what);
+  input_file in(path);
+  return read_whole<secret_bytes>(in, what);
 }
 
 bool same_file(const std::string& one, const std::string& other) {
@@ -170,45 +99,23 @@ bool same_file(const std::string& one, const std::string& other) {
   return one != "-" && other != "-" && fs::equivalent(one, other, ignored);
 }
 
-void check_output(const std::string& path, const output_rules& rules) {
+void refuse_overwriting(const std::string& output, const std::vector<std::string>& inputs) {
   std::error_code ignored;
-  if (path != "-" && rules.existing == overwrite::never && fs::is_regular_file(fs::status(path, ignored))) {
-    refuse_existing(path);
+  if (output == "-" || !fs::is_regular_file(output, ignored)) {
+    return;  // there is nothing to lose
+  }
+  for (const std::string& input : inputs) {
+    if (same_file(output, input == "-" ? "/dev/stdin" : input)) {
+      throw usage_error(fmt::format("{} is an input of this command and would be overwritten", output),
+                        "name another file for the output");
+    }
   }
 }
 
-void write_file(const std::string& path, byte_view content, const output_rules& rules) {
-  std::error_code ignored;
-  const fs::file_status status = fs::status(path, ignored);
-  if (fs::exists(status) && !fs::is_regular_file(status)) {
-    write_straight(path, content);
-    return;
+void refuse_shared_input(std::initializer_list<const std::string*> inputs) {
+  if (std::ranges::count(inputs, "-", [](const std::string* path) { return *path; }) > 1) {
+    throw usage_error("only one input can come from standard input", "name a file for the others");
   }
-  // A link stays a link: what it leads to is replaced.
-  const std::string target = fs::is_regular_file(status) ? fs::canonical(path).string() : path;
-  const fs::path folder = fs::path(target).parent_path();
-  temporary_name temporary((folder / ("." + fs::path(target).filename().string() + ".XXXXXX")).string());
-  descriptor out(::mkostemp(temporary.data(), O_CLOEXEC));
-  if (out.get() < 0) {
-    temporary.release();
-    refuse("write", path, errno);
-  }
-  write_all(out.get(), content, path);
-  if (::fchmod(out.get(), rules.mode & ~current_umask()) != 0 || ::fsync(out.get()) != 0 || out.reset() != 0) {
-    refuse("write", path, errno);
-  }
-  put_in_place(temporary, target, rules.existing);
-}
-
-void write_binary(const std::string& path, byte_view content, const output_rules& rules) {
-  if (path != "-") {
-    write_file(path, content, rules);
-    return;
-  }
-  if (::isatty(STDOUT_FILENO) == 1) {
-    throw usage_error("binary output does not go to a terminal", "name a file with -o, or redirect the output");
-  }
-  write_all(STDOUT_FILENO, content, "standard output");
 }
 
 }  // namespace kmctl

@@ -1,13 +1,13 @@
-// Files in and out. "-" is standard input or output.
+// Files in. "-" is standard input.
 #ifndef KEYMASTER_CLIENT_KMCTL_FILES_H_
 #define KEYMASTER_CLIENT_KMCTL_FILES_H_
 
-#include <sys/types.h>
-
 #include <cstdint>
+#include <initializer_list>
 #include <optional>
 #include <span>
 #include <string>
+#include <vector>
 
 #include "client/lib/bytes.h"
 
@@ -31,6 +31,10 @@ class input_file {
 
   /// The bytes that a regular file has; nothing for a pipe or a terminal.
   [[nodiscard]] std::optional<std::uint64_t> size() const { return size_; }
+  [[nodiscard]] const std::string& path() const { return path_; }
+
+  /// still_named tells whether the file's name still leads to it, or another file has been put in its place.
+  [[nodiscard]] bool still_named() const;
 
  private:
   std::string path_;
@@ -44,30 +48,17 @@ inline constexpr std::size_t small_file_limit = std::size_t{1} << 20;
 /// read_small_file reads a whole file; `what` names its content in the message when it is too large. Throws
 /// failure_error. read_secret_file does the same for private keys.
 [[nodiscard]] bytes read_small_file(const std::string& path, const char* what);
+[[nodiscard]] bytes read_small_file(input_file& file, const char* what);
 [[nodiscard]] secret_bytes read_secret_file(const std::string& path, const char* what);
-
-enum class overwrite { never, always };
-
-/// How a file is written.
-struct output_rules {
-  overwrite existing = overwrite::always;
-  mode_t mode = 0666;  ///< before the umask
-};
-
-/// write_file writes a whole file so that at any moment, a crash included, either the old content or the new one is
-/// there: through a temporary file in the same folder that is renamed when it is complete. What is not a regular file
-/// (a terminal, /dev/null, a pipe) is written straight. Throws failure_error, also when the file exists and must not.
-void write_file(const std::string& path, byte_view content, const output_rules& rules);
-
-/// check_output refuses, before any work is done, an output that write_file would refuse because it exists.
-void check_output(const std::string& path, const output_rules& rules);
 
 /// same_file tells whether two names lead to the same existing file.
 [[nodiscard]] bool same_file(const std::string& one, const std::string& other);
 
-/// write_binary writes to the file `path`, or for "-" to standard output. Throws failure_error, and usage_error when
-/// standard output is a terminal.
-void write_binary(const std::string& path, byte_view content, const output_rules& rules);
+/// refuse_overwriting refuses an output that is one of the command's inputs under any name. Throws usage_error.
+void refuse_overwriting(const std::string& output, const std::vector<std::string>& inputs);
+
+/// refuse_shared_input refuses more than one "-" among the inputs of a command. Throws usage_error.
+void refuse_shared_input(std::initializer_list<const std::string*> inputs);
 
 }  // namespace kmctl
 

@@ -85,6 +85,11 @@ std::string quoted(const std::string& word) {
   return text + "'";
 }
 
+/// A file name that can't be taken for an option.
+std::string as_operand(const std::string& file) {
+  return file.starts_with("-") ? "./" + file : file;
+}
+
 }  // namespace
 
 command_result run_command(const std::vector<std::string>& words) {
@@ -117,8 +122,23 @@ std::string command_line(const std::vector<std::string>& words) {
 
 std::vector<std::string> verify_command(const std::string& public_key, const std::string& signature,
                                         const std::string& file) {
-  const std::string path = file.starts_with("-") ? "./" + file : file;
-  return {"openssl", "dgst", "-sha256", "-verify", public_key, "-signature", signature, path};
+  return {"openssl", "dgst", "-sha256", "-verify", public_key, "-signature", signature, as_operand(file)};
+}
+
+std::vector<std::string> mac_command(const std::string& key, const std::string& file) {
+  return {"openssl", "dgst", "-sha256", "-mac", "HMAC", "-macopt", "hexkey:" + key, as_operand(file)};
+}
+
+std::vector<std::string> oaep_command(const std::string& public_key, const std::string& secret,
+                                      const std::string& ciphertext) {
+  return {"openssl",  "pkeyutl",
+          "-encrypt", "-pubin",
+          "-inkey",   public_key,
+          "-pkeyopt", "rsa_padding_mode:oaep",
+          "-pkeyopt", "rsa_oaep_md:sha256",
+          "-pkeyopt", "rsa_mgf1_md:sha1",
+          "-in",      secret,
+          "-out",     ciphertext};
 }
 
 }  // namespace kmctl

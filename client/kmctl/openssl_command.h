@@ -19,9 +19,17 @@ struct command_result {
 /// command_line gives the words as a person would type them in a shell.
 [[nodiscard]] std::string command_line(const std::vector<std::string>& words);
 
-/// verify_command gives the words that check an RSA PKCS#1 v1.5 signature over SHA-256 with openssl.
+/// verify_command gives the words that check a signature over SHA-256 with openssl: RSA PKCS#1 v1.5 or EC.
 [[nodiscard]] std::vector<std::string> verify_command(const std::string& public_key, const std::string& signature,
                                                       const std::string& file);
+
+/// mac_command gives the words that make a file's HMAC-SHA-256 with a key in hexadecimal.
+[[nodiscard]] std::vector<std::string> mac_command(const std::string& key, const std::string& file);
+
+/// oaep_command gives the words that encrypt a file with RSA-OAEP over SHA-256 for the TA, whose OAEP has MGF1 on SHA-1
+/// whatever the digest.
+[[nodiscard]] std::vector<std::string> oaep_command(const std::string& public_key, const std::string& secret,
+                                                    const std::string& ciphertext);
 
 }  // namespace kmctl
 

@@ -4,8 +4,10 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
+#include <iterator>
+#include <utility>
 
+#include "client/kmctl/console.h"
 #include "client/kmctl/values.h"
 
 namespace kmctl {
@@ -16,6 +18,14 @@ using std::chrono::steady_clock;
 constexpr auto patience = std::chrono::milliseconds(200);
 constexpr auto pace = std::chrono::milliseconds(100);
 constexpr const char* erase_line = "\r\x1b[K";
+
+/// A line is short, so it is put together without the heap: a thread and a destructor must not throw.
+template <class... Values>
+void show(fmt::format_string<Values...> format, Values&&... values) {
+  fmt::basic_memory_buffer<char, 512> line;
+  fmt::format_to(std::back_inserter(line), format, std::forward<Values>(values)...);
+  complain({line.data(), line.size()});
+}
 
 bool stderr_is_terminal() {
   return ::isatty(STDERR_FILENO) == 1;
@@ -28,7 +38,7 @@ progress_bar::progress_bar(std::string label, std::optional<std::uint64_t> total
 
 progress_bar::~progress_bar() {
   if (drawn_) {
-    fmt::print(stderr, "{}", erase_line);
+    complain(erase_line);
   }
 }
 
@@ -44,13 +54,13 @@ void progress_bar::draw() {
   constexpr std::uint64_t width = 30;
   drawn_ = true;
   if (!total_ || *total_ == 0) {
-    fmt::print(stderr, "{}{}  {}", erase_line, label_, format_size(done_));
+    show("{}{}  {}", erase_line, label_, format_size(done_));
     return;
   }
   const double part = std::min(1.0, static_cast<double>(done_) / static_cast<double>(*total_));
   const auto filled = static_cast<std::size_t>(part * static_cast<double>(width));
-  fmt::print(stderr, "{}{} [{:=<{}}{: <{}}] {:3.0f} %  {}", erase_line, label_, "", filled, "", width - filled,
-             part * 100, format_size(done_));
+  show("{}{} [{:=<{}}{: <{}}] {:3.0f} %  {}", erase_line, label_, "", filled, "", width - filled, part * 100,
+       format_size(done_));
 }
 
 spinner::spinner(std::string label) : label_(std::move(label)) {
@@ -77,11 +87,11 @@ void spinner::turn() {
   std::unique_lock lock(mutex_);
   for (std::size_t i = 0; !ended_.wait_for(lock, drawn ? pace : patience, [this] { return end_; }); ++i) {
     const std::chrono::duration<double> passed = steady_clock::now() - start;
-    fmt::print(stderr, "{}{} {}  {:.1f} s", erase_line, label_, marks[i % marks.size()], passed.count());
+    show("{}{} {}  {:.1f} s", erase_line, label_, marks[i % marks.size()], passed.count());
     drawn = true;
   }
   if (drawn) {
-    fmt::print(stderr, "{}", erase_line);
+    complain(erase_line);
   }
 }
 

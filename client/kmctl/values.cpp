@@ -128,11 +128,15 @@ bytes parse_bytes(const std::string& text) {
   if (text.starts_with("hex:")) {
     return parse_hex(std::string_view(text).substr(4));
   }
-  if (text.starts_with("@")) {
-    return read_small_file(text.substr(1), "value");
+  if (const auto file = file_of_value(text)) {
+    return read_small_file(*file, "value");
   }
   const byte_view raw = keymaster::client::as_bytes(text.starts_with("text:") ? text.c_str() + 5 : text.c_str());
   return {raw.begin(), raw.end()};
+}
+
+std::optional<std::string> file_of_value(const std::string& text) {
+  return text.starts_with("@") ? std::optional(text.substr(1)) : std::nullopt;
 }
 
 date parse_date(std::string_view text) {

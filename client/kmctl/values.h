@@ -3,6 +3,7 @@
 #define KEYMASTER_CLIENT_KMCTL_VALUES_H_
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -23,6 +24,9 @@ using keymaster::client::date;
 /// parse_bytes reads a byte string: `hex:0A0B`, `@FILE` for a file's content, `text:…` for the rest as it stands, and
 /// anything else as the text itself. Throws usage_error, or failure_error when the file can't be read.
 [[nodiscard]] bytes parse_bytes(const std::string& text);
+
+/// file_of_value gives FILE when the text of a byte string is `@FILE`, and nothing otherwise.
+[[nodiscard]] std::optional<std::string> file_of_value(const std::string& text);
 
 /// parse_date reads ISO 8601: 2030-01-31, 2030-01-31T12:00, 2030-01-31T12:00:30.5, each with a Z or an offset such as
 /// +02:00 behind it if wanted; without one it is UTC. Throws usage_error, also for dates before 1970.

@@ -78,6 +78,13 @@ std::optional<std::uint64_t> authorizations::unique_number(keymaster_tag_t tag) 
   return found.size() == 1 ? std::optional(found.front()) : std::nullopt;
 }
 
+std::optional<bytes> authorizations::unique_blob(keymaster_tag_t tag) const {
+  if (count(tag) != 1) {
+    return std::nullopt;
+  }
+  return std::ranges::find(list_, tag, &authorization::tag)->blob;
+}
+
 std::size_t authorizations::marshalled_size() const {
   std::size_t size = 4;
   for (const authorization& one : list_) {

@@ -81,6 +81,8 @@ class authorizations {
   /// numbers gives the values of a tag in order; unique_number its value when the tag occurs exactly once.
   [[nodiscard]] std::vector<std::uint64_t> numbers(keymaster_tag_t tag) const;
   [[nodiscard]] std::optional<std::uint64_t> unique_number(keymaster_tag_t tag) const;
+  /// unique_blob gives the bytes of a tag when it occurs exactly once.
+  [[nodiscard]] std::optional<bytes> unique_blob(keymaster_tag_t tag) const;
 
   [[nodiscard]] std::size_t size() const { return list_.size(); }
   [[nodiscard]] bool empty() const { return list_.empty(); }

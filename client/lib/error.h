@@ -24,7 +24,7 @@ struct failure {
 };
 
 /// Thrown by every call of this library that the TEE or the TA refuses. what() names the step and both levels;
-/// hint() says what to try, and is empty when there is nothing to say beyond the names.
+/// hint() says what to try.
 class error : public std::runtime_error {
  public:
   explicit error(failure facts);
@@ -38,7 +38,7 @@ class error : public std::runtime_error {
   std::string hint_;
 };
 
-/// hint_for looks a failure up in the table of advice; empty when it has none.
+/// hint_for looks a failure up in the table of advice. What is not in there can be found in the trace, and it says so.
 [[nodiscard]] std::string hint_for(const failure& facts);
 
 }  // namespace keymaster::client

@@ -11,8 +11,13 @@ namespace keymaster::client {
 namespace {
 
 constexpr std::uint32_t tee_error_mac_invalid = 0xFFFF3071;
+constexpr std::uint32_t tee_error_storage_no_space = 0xFFFF3041;
 constexpr std::uint32_t ksk_error_deleted = 0xF0100001;
 constexpr std::uint32_t ksk_error_rpmb_gone = 0xF0100003;
+
+/// Where nothing better is known.
+constexpr std::string_view look_at_the_trace =
+    "run it again with KEYMASTER_TRACE=error (kmctl --trace error): the trace names the call that failed";
 
 struct tee_advice {
   std::string_view step;
@@ -30,10 +35,19 @@ constexpr std::array tee_advices = std::to_array<tee_advice>({
     {"connect", TEEC_ERROR_BAD_FORMAT,
      "a text file of the state folder, most likely `settings`, can't be parsed: --trace error names the file and the "
      "line, and docs/hosted-tee.md tells what settings may say"},
-    {"connect", TEEC_ERROR_BAD_PARAMETERS, "a TEE name has the form embedded:FOLDER"},
+    {"connect", TEEC_ERROR_BAD_PARAMETERS,
+     "a TEE name has the form embedded:FOLDER, and the folder is new, empty or a device's state: one that holds "
+     "something else is left alone"},
+    {"connect", TEEC_ERROR_OUT_OF_MEMORY, "the system has no memory left: end other programs"},
     {"connect", TEEC_ERROR_GENERIC, "check that the state folder can be made and written, and that its disk has room"},
     {"open_session", TEEC_ERROR_ITEM_NOT_FOUND,
      "the TEE has no image of the Keymaster TA: build it, or point KEYMASTER_TA_PATH at the folder of the .ta files"},
+    {"open_session", TEEC_ERROR_BAD_FORMAT,
+     "the image of the Keymaster TA is damaged or belongs to another version: build it again, or point "
+     "KEYMASTER_TA_PATH at the folder of the right .ta files"},
+    {"open_session", tee_error_storage_no_space,
+     "the TA could not store its key storage key: make room on the disk of the state folder"},
+    {"open_session", TEEC_ERROR_OUT_OF_MEMORY, "the TA could not start for want of memory: end other programs"},
     {"open_session", ksk_error_deleted,
      "the stored key storage key was malformed and is deleted now; the next start makes a new one, and blobs sealed "
      "under the old one are lost"},
@@ -44,14 +58,23 @@ constexpr std::array tee_advices = std::to_array<tee_advice>({
     {"", TEEC_ERROR_OUT_OF_MEMORY,
      "the TA's heap is 512 KiB: use less input at once, or finish other operations first"},
     {"", TEEC_ERROR_BUSY, "the TEE is busy: try again"},
+    {"", TEEC_ERROR_SHORT_BUFFER,
+     "the answer is larger than the room for it: client and TA are of different versions, build both again"},
+    {"", TEEC_ERROR_NOT_IMPLEMENTED, "the TA does not have this command: kmctl info lists what it offers"},
+    {"", TEEC_ERROR_BAD_FORMAT, "the TA can't read the request: client and TA are of different versions"},
+    {"", TEEC_ERROR_COMMUNICATION, "the way to the TEE broke: open a new session"},
+    {"", tee_error_storage_no_space, "make room on the disk of the state folder"},
     {"generate_key", TEEC_ERROR_BAD_PARAMETERS,
      "the platform refuses these parameters: a public exponent is odd and at least 3"},
     {"generate_key", TEEC_ERROR_NOT_SUPPORTED,
-     "the platform does not make keys of this size: RSA takes 512 to 8192 bits"},
-    {"begin", TEEC_ERROR_NOT_SUPPORTED, "the platform does not serve keys of this size: RSA takes 512 to 8192 bits"},
+     "the platform does not make keys of this size: RSA takes 512 to 8192 bits, EC the sizes of the NIST prime curves"},
+    {"begin", TEEC_ERROR_NOT_SUPPORTED,
+     "the platform does not serve keys of this size: RSA takes 512 to 8192 bits, EC the sizes of the NIST prime "
+     "curves"},
     {"begin", TEEC_ERROR_BAD_PARAMETERS, "the platform refuses the key's components: the imported key was not sound"},
     {"finish", TEEC_ERROR_BAD_PARAMETERS,
-     "the platform refuses the input: without a digest it must be a number below the key's modulus"},
+     "the platform refuses the input: RSA without a digest takes a number below the key's modulus, ECB and CBC without "
+     "padding take whole blocks of 16 bytes"},
 });
 
 struct keymaster_advice {
@@ -64,26 +87,39 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
     {"", KM_ERROR_UNSUPPORTED_PURPOSE, "the algorithm does not serve this purpose: kmctl info lists what it does"},
     {"", KM_ERROR_INCOMPATIBLE_PURPOSE, "the key was not made for this purpose: look at its characteristics"},
     {"", KM_ERROR_UNSUPPORTED_ALGORITHM, "the TA does not offer this algorithm: kmctl info lists what it offers"},
-    {"", KM_ERROR_UNSUPPORTED_KEY_SIZE, "choose a size of this algorithm: RSA takes multiples of 8 up to 8192 bits"},
+    {"", KM_ERROR_UNSUPPORTED_KEY_SIZE,
+     "choose a size of this algorithm: RSA takes multiples of 8 up to 8192 bits, EC 192, 224, 256, 384 or 521, AES "
+     "128, "
+     "192 or 256; HMAC takes multiples of 8 from what its digest demands (192 for sha-256) up to 512 or 1024"},
     {"", KM_ERROR_UNSUPPORTED_BLOCK_MODE,
      "the algorithm does not offer this block mode: kmctl info lists those it does"},
     {"", KM_ERROR_INCOMPATIBLE_BLOCK_MODE, "the key does not allow this block mode: look at its characteristics"},
+    {"", KM_ERROR_UNSUPPORTED_MAC_LENGTH, "ask for a tag of at most 128 bits, in whole bytes"},
     {"", KM_ERROR_UNSUPPORTED_PADDING_MODE, "this purpose does not offer this padding: kmctl info lists those it does"},
     {"", KM_ERROR_INCOMPATIBLE_PADDING_MODE, "the key does not allow this padding: look at its characteristics"},
-    {"", KM_ERROR_UNSUPPORTED_DIGEST, "the algorithm does not offer this digest: kmctl info lists those it does"},
+    {"", KM_ERROR_UNSUPPORTED_DIGEST,
+     "the algorithm does not offer this digest (kmctl info lists those it does), or an HMAC key names none or several"},
     {"", KM_ERROR_INCOMPATIBLE_DIGEST,
-     "the key does not allow this digest, or it does not go with the padding: PSS needs SHA-1 or SHA-2 and room in the "
-     "key, raw padding needs no digest"},
+     "the key does not allow this digest, or it does not go with the padding: PSS and OAEP need SHA-1 or SHA-2 and "
+     "room in the key, raw padding and PKCS#1 encryption need no digest"},
     {"", -17, "keys of this algorithm never leave the TA: only RSA and EC keys have a public part"},
-    {"", KM_ERROR_INVALID_INPUT_LENGTH,
-     "without a digest the input is at most as long as the key (11 bytes less with pkcs1-1-5-sign): use a digest"},
+    {"update", KM_ERROR_INVALID_INPUT_LENGTH,
+     "the input is longer than this key can take at once: sign with a digest (without one, RSA takes at most the key's "
+     "length, 11 bytes less with pkcs1-1-5-sign); what RSA encrypts must fit into the key, so encrypt an AES key with "
+     "it"},
+    {"finish", KM_ERROR_INVALID_INPUT_LENGTH,
+     "the input has a length that cannot be: ECB and CBC work on whole blocks of 16 bytes unless pkcs7 fills the last "
+     "one; OAEP leaves room for the key's length less two digests and 2 bytes, pkcs1-1-5-encrypt for 11 bytes less"},
+    {"", KM_ERROR_INVALID_INPUT_LENGTH, "the input is longer than this key can take at once"},
     {"", KM_ERROR_KEY_NOT_YET_VALID, "the key's active date lies ahead: check the clock"},
     {"", KM_ERROR_KEY_EXPIRED, "the key's date for this purpose has passed: make a new key"},
     {"", KM_ERROR_KEY_USER_NOT_AUTHENTICATED, "the key's user must authenticate: pass a fresh auth token"},
     {"", KM_ERROR_INVALID_OPERATION_HANDLE, "the operation has ended (any failure ends it): begin again"},
     {"", KM_ERROR_VERIFICATION_FAILED,
-     "the signature is not one of this key over this input: check that data, signature, key, padding and digest belong "
-     "together"},
+     "the signature, MAC or tag is not one of this key over this input: check that they belong together, with padding, "
+     "digest, nonce and associated data"},
+    {"", KM_ERROR_INSUFFICIENT_BUFFER_SPACE,
+     "the answer is larger than the room for it: client and TA are of different versions, build both again"},
     {"", KM_ERROR_TOO_MANY_OPERATIONS,
      "sixteen operations are open, or eight counted keys: finish or abort some first"},
     {"", KM_ERROR_INVALID_KEY_BLOB,
@@ -92,8 +128,12 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
     {"generate_key", KM_ERROR_INVALID_ARGUMENT,
      "name algorithm, size and (for RSA) the public exponent exactly once, and do not state an origin"},
     {"begin", KM_ERROR_INVALID_ARGUMENT,
-     "name padding and digest exactly once; a key with a user id needs an auth type; an auth token must be of this "
-     "boot"},
+     "name padding, digest, block mode and MAC length exactly once; a nonce has 12 bytes for gcm and 16 for cbc and "
+     "ctr; "
+     "a key with a user id needs an auth type; an auth token must be of this boot"},
+    {"finish", KM_ERROR_INVALID_ARGUMENT,
+     "the text has not the padding that it must have: key, padding, digest and nonce must be those of the encryption, "
+     "and the ciphertext unchanged and whole (without padding, RSA takes a number below the key's modulus)"},
     {"", KM_ERROR_INVALID_ARGUMENT, "the parameters do not fit the command: state each one once"},
     {"", KM_ERROR_INVALID_TAG, "leave out what this command does not take, and state the rest once"},
     {"", KM_ERROR_MEMORY_ALLOCATION_FAILED, "the TA's heap is 512 KiB: finish other operations first"},
@@ -103,9 +143,10 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
     {"", KM_ERROR_KEY_MAX_OPS_EXCEEDED,
      "the uses of this boot are used up: they begin anew when the secure world starts again"},
     {"", KM_ERROR_INVALID_MAC_LENGTH, "ask for a MAC at least as long as the key's minimum"},
-    {"", -58, "state a minimum MAC length"},
+    {"", -58, "state a minimum MAC length: gcm keys need one"},
     {"", KM_ERROR_UNSUPPORTED_MIN_MAC_LENGTH,
-     "the minimum MAC length must be a multiple of 8 in the algorithm's range"},
+     "the minimum MAC length must be a multiple of 8: for gcm 96 to 128, for HMAC 64 to the digest's length"},
+    {"finish", KM_ERROR_UNKNOWN_ERROR, "a MAC is at most as long as its digest: ask for a shorter one"},
     {"", KM_ERROR_UNIMPLEMENTED, "the algorithm does not have this step: leave it out"},
 });
 
@@ -116,12 +157,12 @@ std::string hint_for(const failure& facts) {
   if (facts.tee_result != 0) {
     const auto row = std::ranges::find_if(
         tee_advices, [&](const tee_advice& advice) { return advice.result == facts.tee_result && fits(advice.step); });
-    return row == tee_advices.end() ? std::string{} : std::string(row->text);
+    return std::string(row == tee_advices.end() ? look_at_the_trace : row->text);
   }
   const auto row = std::ranges::find_if(keymaster_advices, [&](const keymaster_advice& advice) {
     return advice.error == facts.keymaster_error && fits(advice.step);
   });
-  return row == keymaster_advices.end() ? std::string{} : std::string(row->text);
+  return std::string(row == keymaster_advices.end() ? look_at_the_trace : row->text);
 }
 
 }  // namespace keymaster::client

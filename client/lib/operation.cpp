@@ -12,7 +12,7 @@ namespace {
 /// The most that begin answers is a nonce: a count, a record and 16 bytes. The room beyond costs nothing.
 constexpr std::size_t begin_capacity = 256;
 
-/// An update may put out what earlier ones held back: a block and a tag.
+/// An update may put out what earlier ones held back: a block, or a tag that turns out to be text.
 constexpr std::size_t update_headroom = 32;
 
 /// Two lengths and the count of an empty list stand around the output of finish.
@@ -92,6 +92,16 @@ bytes operation::update(byte_view input, const authorizations& parameters) {
     input = input.subspan(done.consumed);
   }
   return output;
+}
+
+void operation::add_associated_data(byte_view data, const authorizations& parameters) {
+  while (!data.empty()) {
+    const byte_view piece = data.first(std::min(data.size(), chunk_size));
+    authorizations all = parameters;
+    all.associated_data(piece);
+    update_once({}, all);
+    data = data.subspan(piece.size());
+  }
 }
 
 operation::result operation::finish(byte_view signature, const authorizations& parameters, std::size_t output_limit) {

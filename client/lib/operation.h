@@ -34,8 +34,12 @@ class operation {
   /// The handle that an auth token for this very operation must carry as its challenge.
   [[nodiscard]] std::uint32_t handle() const { return handle_; }
 
-  /// What begin answered beside the handle: a nonce that the TA drew, for example.
+  /// What begin answered beside the handle: the nonce that an AES operation works with.
   [[nodiscard]] const authorizations& parameters() const { return parameters_; }
+
+  /// The nonce that begin answered, whether the TA drew it or the caller gave it; empty where there is none. Whoever
+  /// decrypts needs it.
+  [[nodiscard]] bytes nonce() const { return parameters_.unique_blob(KM_TAG_NONCE).value_or(bytes{}); }
 
   struct step {
     bytes output;
@@ -49,6 +53,10 @@ class operation {
   /// update hands over all of `input` in chunks and gives what came out. Throws as update_once; input that the TA does
   /// not take is the error KM_ERROR_INVALID_INPUT_LENGTH.
   bytes update(byte_view input, const authorizations& parameters = {});
+
+  /// add_associated_data has GCM authenticate `data` without encrypting it. It goes to the TA in chunks, so that its
+  /// size does not matter, and before any input: afterwards the TA answers KM_ERROR_INVALID_TAG. Throws as update_once.
+  void add_associated_data(byte_view data, const authorizations& parameters = {});
 
   struct result {
     bytes output;

@@ -141,4 +141,11 @@ TEST(Authorizations, AListCanBeAddedToItself) {
   EXPECT_EQ(list.numbers(KM_TAG_DIGEST), (std::vector<std::uint64_t>{2, 2}));
 }
 
+TEST(Authorizations, ABlobIsFoundWhenItIsTheOnlyOne) {
+  auto list = authorizations{}.key_size(1);
+  EXPECT_EQ(list.unique_blob(KM_TAG_NONCE), std::nullopt);
+  EXPECT_EQ(list.nonce(bytes{1, 2}).unique_blob(KM_TAG_NONCE), (bytes{1, 2}));
+  EXPECT_EQ(list.nonce(bytes{3}).unique_blob(KM_TAG_NONCE), std::nullopt);
+}
+
 }  // namespace

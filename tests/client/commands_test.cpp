@@ -326,6 +326,31 @@ TEST_F(CommandsTest, AStreamEndsWithItsSource) {
   EXPECT_EQ(output, (bytes{1, 2}));
 }
 
+TEST_F(CommandsTest, TheNonceIsWhatBeginAnswered) {
+  const bytes nonce{1, 2, 3};
+  prepare({.b = 1, .body = authorizations{}.nonce(nonce).marshal()});
+  EXPECT_EQ(operation::begin(*ta, KM_PURPOSE_ENCRYPT, bytes{1}, {}).nonce(), nonce);
+  EXPECT_TRUE(begin(2).nonce().empty());
+}
+
+TEST_F(CommandsTest, AssociatedDataGoesInChunksWithoutInput) {
+  auto op = begin(7);
+  const bytes data(chunk_size + 1, 0x44);
+  const auto every_time = authorizations{}.auth_token(bytes{9});
+  op.add_associated_data(data, every_time);
+  ASSERT_EQ(count(), 3U);
+  for (std::size_t i = 1; i < 3; ++i) {
+    const byte_view piece = i == 1 ? byte_view(data).first(chunk_size) : byte_view(data).last(1);
+    bytes request;
+    append_block(request, {});
+    append_block(request, authorizations(every_time).associated_data(piece).marshal());
+    EXPECT_EQ(fake_tee::now().arrivals[i].command, 17U);
+    EXPECT_EQ(fake_tee::now().arrivals[i].request, request);
+  }
+  op.add_associated_data({});
+  EXPECT_EQ(count(), 3U) << "no data is nothing to send";
+}
+
 TEST_F(CommandsTest, CapabilitiesAskForExactlyTheAnnouncedSize) {
   prepare({.a = 1});
   prepare({.body = parse_hex("01000000")});

@@ -73,6 +73,9 @@ TEEC_Result TEEC_InvokeCommand(TEEC_Session* /*session*/, uint32_t command, TEEC
     out.size = answer.body.size();
   }
   tee.arrivals.push_back(seen);
+  if (tee.at_command) {
+    tee.at_command();
+  }
   if (has_value) {
     value = {answer.a, answer.b};
   }

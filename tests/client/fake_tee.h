@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <deque>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -42,6 +43,7 @@ struct state {
   int open_contexts = 0;
   int open_sessions = 0;
   std::string connected_to;
+  std::function<void()> at_command;  ///< called with each command, before it is answered
 };
 
 state& now();

@@ -2,74 +2,19 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 
 #include "client/kmctl/exit_codes.h"
+#include "client/kmctl/output_file.h"
+#include "tests/client/folder_fixture.h"
 
 namespace {
 
 using namespace kmctl;
 namespace fs = std::filesystem;
 
-class FilesTest : public testing::Test {
- protected:
-  void SetUp() override {
-    std::string name = (fs::temp_directory_path() / "kmctl-files-XXXXXX").string();
-    ASSERT_NE(::mkdtemp(name.data()), nullptr);
-    folder_ = name;
-  }
-  void TearDown() override { fs::remove_all(folder_); }
-
-  [[nodiscard]] std::string path(const char* name) const { return (folder_ / name).string(); }
-  [[nodiscard]] std::size_t entries() const {
-    return static_cast<std::size_t>(std::distance(fs::directory_iterator(folder_), fs::directory_iterator()));
-  }
-
-  fs::path folder_;
-};
-
-constexpr output_rules keep{.existing = overwrite::never, .mode = 0600};
-
-TEST_F(FilesTest, AFileIsWrittenWholeWithItsMode) {
-  write_file(path("blob"), bytes{1, 2, 3}, keep);
-  EXPECT_EQ(read_small_file(path("blob"), "blob"), (bytes{1, 2, 3}));
-  EXPECT_EQ(fs::status(path("blob")).permissions(), fs::perms::owner_read | fs::perms::owner_write);
-  EXPECT_EQ(entries(), 1U);
-}
-
-TEST_F(FilesTest, AnExistingFileStaysUnlessItMayBeOverwritten) {
-  write_file(path("blob"), bytes{1}, keep);
-  EXPECT_THROW(write_file(path("blob"), bytes{2}, keep), failure_error);
-  EXPECT_THROW(check_output(path("blob"), keep), failure_error);
-  EXPECT_EQ(read_small_file(path("blob"), "blob"), bytes{1});
-  write_file(path("blob"), bytes{3}, {});
-  EXPECT_EQ(read_small_file(path("blob"), "blob"), bytes{3});
-  EXPECT_EQ(entries(), 1U) << "a temporary file was left behind";
-}
-
-TEST_F(FilesTest, ALinkStaysALink) {
-  write_file(path("target"), bytes{1}, {});
-  fs::create_symlink("target", path("link"));
-  write_file(path("link"), bytes{2}, {});
-  EXPECT_TRUE(fs::is_symlink(path("link")));
-  EXPECT_EQ(read_small_file(path("target"), "file"), bytes{2});
-}
-
-TEST_F(FilesTest, WhatIsNotARegularFileIsWrittenStraight) {
-  write_file("/dev/null", bytes{1}, keep);
-  EXPECT_TRUE(fs::is_character_file("/dev/null"));
-}
-
-TEST_F(FilesTest, AFolderThatIsMissingIsNamed) {
-  try {
-    write_file(path("no/such"), bytes{1}, {});
-    FAIL();
-  } catch (const failure_error& refused) {
-    EXPECT_NE(std::string(refused.what()).find(path("no/such")), std::string::npos);
-  }
-}
+using FilesTest = folder_fixture;
 
 TEST_F(FilesTest, AFileThatIsTooLargeForABlobIsRefused) {
   std::ofstream(path("large")).close();
@@ -96,6 +41,30 @@ TEST_F(FilesTest, TwoNamesOfOneFileAreRecognised) {
   EXPECT_TRUE(same_file(path("one"), path("other")));
   EXPECT_FALSE(same_file(path("one"), path("absent")));
   EXPECT_FALSE(same_file("-", "-"));
+}
+
+TEST_F(FilesTest, AnInputIsNeverTheOutput) {
+  write_file(path("one"), bytes{1}, {});
+  write_file(path("other"), bytes{1}, {});
+  fs::create_symlink("one", path("link"));
+  fs::create_hard_link(path("one"), path("twin"));
+  for (const char* const name : {"one", "link", "twin"}) {
+    EXPECT_THROW(refuse_overwriting(path(name), {path("other"), path("one")}), usage_error) << name;
+  }
+  EXPECT_NO_THROW(refuse_overwriting(path("one"), {path("other"), path("absent"), "", "-"}));
+  EXPECT_NO_THROW(refuse_overwriting(path("absent"), {path("absent")}));
+  EXPECT_NO_THROW(refuse_overwriting("/dev/null", {"/dev/null"}));
+  EXPECT_NO_THROW(refuse_overwriting("-", {"-"}));
+}
+
+TEST_F(FilesTest, AFileIsKnownToBeTheOneThatWasOpened) {
+  write_file(path("blob"), bytes{1}, {});
+  const input_file in(path("blob"));
+  EXPECT_TRUE(in.still_named());
+  write_file(path("blob"), bytes{1}, {});
+  EXPECT_FALSE(in.still_named());
+  fs::remove(path("blob"));
+  EXPECT_FALSE(in.still_named());
 }
 
 }  // namespace

@@ -52,6 +52,75 @@ TEST(KeyOptions, RawPaddingGoesWithoutADigest) {
   EXPECT_EQ(all.numbers(KM_TAG_DIGEST), std::vector<std::uint64_t>{KM_DIGEST_NONE});
 }
 
+TEST(KeyOptions, AnRsaKeyEncryptsWhenItsPurposesOrItsPaddingsSaySo) {
+  const auto encrypts = [](const authorizations& given, std::vector<std::uint64_t> paddings, std::uint64_t digest) {
+    const auto all = with_defaults(given, option_use::generate);
+    EXPECT_EQ(all.numbers(KM_TAG_PURPOSE), (std::vector<std::uint64_t>{KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT}));
+    EXPECT_EQ(all.numbers(KM_TAG_PADDING), paddings);
+    EXPECT_EQ(all.numbers(KM_TAG_DIGEST), std::vector<std::uint64_t>{digest});
+  };
+  encrypts(authorizations{}.purpose({KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT}), {KM_PAD_RSA_OAEP}, KM_DIGEST_SHA_2_256);
+  encrypts(authorizations{}.padding({KM_PAD_RSA_OAEP}), {KM_PAD_RSA_OAEP}, KM_DIGEST_SHA_2_256);
+  encrypts(authorizations{}.padding({KM_PAD_RSA_PKCS1_1_5_ENCRYPT}), {KM_PAD_RSA_PKCS1_1_5_ENCRYPT}, KM_DIGEST_NONE);
+}
+
+TEST(KeyOptions, AnRsaKeyMayDoBoth) {
+  const auto by_purpose =
+      with_defaults(authorizations{}.purpose({KM_PURPOSE_SIGN, KM_PURPOSE_DECRYPT}), option_use::generate);
+  EXPECT_EQ(by_purpose.numbers(KM_TAG_PADDING),
+            (std::vector<std::uint64_t>{KM_PAD_RSA_PKCS1_1_5_SIGN, KM_PAD_RSA_OAEP}));
+  const auto by_padding =
+      with_defaults(authorizations{}.padding({KM_PAD_RSA_PSS, KM_PAD_RSA_OAEP}), option_use::generate);
+  EXPECT_EQ(by_padding.count(KM_TAG_PURPOSE), 4U);
+}
+
+TEST(KeyOptions, OtherAlgorithmsHaveDefaultsOfTheirOwn) {
+  EXPECT_EQ(with_defaults(authorizations{}.algorithm(KM_ALGORITHM_EC), option_use::generate),
+            authorizations{}
+                .algorithm(KM_ALGORITHM_EC)
+                .key_size(256)
+                .purpose({KM_PURPOSE_SIGN, KM_PURPOSE_VERIFY})
+                .digest({KM_DIGEST_SHA_2_256})
+                .no_auth_required());
+  EXPECT_EQ(with_defaults(authorizations{}.algorithm(KM_ALGORITHM_AES), option_use::generate),
+            authorizations{}
+                .algorithm(KM_ALGORITHM_AES)
+                .key_size(256)
+                .purpose({KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT})
+                .block_mode({KM_MODE_GCM})
+                .padding({KM_PAD_NONE})
+                .min_mac_length(128)
+                .no_auth_required());
+  const auto hmac = authorizations{}.algorithm(KM_ALGORITHM_HMAC);
+  EXPECT_EQ(with_defaults(hmac, option_use::generate).unique_number(KM_TAG_MIN_MAC_LENGTH), 256U);
+  EXPECT_EQ(with_defaults(authorizations(hmac).digest({KM_DIGEST_SHA1}), option_use::import)
+                .unique_number(KM_TAG_MIN_MAC_LENGTH),
+            160U);
+}
+
+TEST(KeyOptions, EveryBlockModeGetsAPaddingForTextsOfAnyLength) {
+  struct row {
+    std::vector<keymaster_block_mode_t> modes;
+    std::vector<std::uint64_t> paddings;
+    bool has_tag;
+  };
+  for (const auto& [modes, paddings, has_tag] : std::vector<row>{
+           {{KM_MODE_CBC}, {KM_PAD_PKCS7}, false},
+           {{KM_MODE_ECB}, {KM_PAD_PKCS7}, false},
+           {{KM_MODE_CTR}, {KM_PAD_NONE}, false},
+           {{KM_MODE_CBC, KM_MODE_GCM}, {KM_PAD_NONE, KM_PAD_PKCS7}, true},
+       }) {
+    auto given = authorizations{}.algorithm(KM_ALGORITHM_AES);
+    for (const auto mode : modes) {
+      given.block_mode({mode});
+    }
+    const auto all = with_defaults(given, option_use::generate);
+    EXPECT_EQ(all.count(KM_TAG_BLOCK_MODE), modes.size());
+    EXPECT_EQ(all.numbers(KM_TAG_PADDING), paddings);
+    EXPECT_EQ(all.contains(KM_TAG_MIN_MAC_LENGTH), has_tag);
+  }
+}
+
 TEST(KeyOptions, AKeyWithAUserNeedsAuthentication) {
   EXPECT_FALSE(
       with_defaults(authorizations{}.user_secure_id(1), option_use::generate).contains(KM_TAG_NO_AUTH_REQUIRED));
@@ -89,6 +158,11 @@ TEST(KeyOptions, AListMayBeGivenInPieces) {
             (std::vector<std::uint64_t>{KM_DIGEST_SHA1, KM_DIGEST_SHA_2_256, KM_DIGEST_NONE}));
 }
 
+TEST(CipherOptions, EveryOptionBecomesItsTag) {
+  EXPECT_EQ(parse(option_use::cipher, "--block-mode cbc --padding pkcs7 --digest sha-1 --mac-length 96"),
+            authorizations{}.block_mode({KM_MODE_CBC}).padding({KM_PAD_PKCS7}).digest({KM_DIGEST_SHA1}).mac_length(96));
+}
+
 TEST(KeyOptions, ValuesThatDontFitAreRefused) {
   EXPECT_THROW(parse(option_use::generate, "--digest sha-1,sha-3"), usage_error);
   EXPECT_THROW(parse(option_use::generate, "--size 1024 --size 2048"), CLI::ParseError);
@@ -97,42 +171,7 @@ TEST(KeyOptions, ValuesThatDontFitAreRefused) {
   EXPECT_THROW(parse(option_use::generate, "--active yesterday"), usage_error);
   EXPECT_THROW(parse(option_use::generate, "--mac-length 96"), CLI::ParseError);
   EXPECT_THROW(parse(option_use::operation, "--purpose sign"), CLI::ParseError);
-}
-
-TEST(OperationParameters, TheOnlyChoiceOfTheKeyIsTaken) {
-  const auto key = authorizations(rsa_2048)
-                       .padding({KM_PAD_RSA_PKCS1_1_5_SIGN, KM_PAD_RSA_OAEP})  // OAEP does not sign
-                       .digest({KM_DIGEST_SHA_2_384});
-  EXPECT_EQ(operation_parameters({}, key),
-            authorizations{}.padding({KM_PAD_RSA_PKCS1_1_5_SIGN}).digest({KM_DIGEST_SHA_2_384}));
-}
-
-TEST(OperationParameters, AChoiceIsTheUsers) {
-  const auto key =
-      authorizations(rsa_2048).padding({KM_PAD_RSA_PKCS1_1_5_SIGN, KM_PAD_RSA_PSS}).digest({KM_DIGEST_SHA_2_256});
-  try {
-    (void)operation_parameters({}, key);
-    FAIL();
-  } catch (const usage_error& refused) {
-    EXPECT_STREQ(refused.what(), "the key allows more than one padding: pkcs1-1-5-sign, pss");
-    EXPECT_EQ(refused.hint(), "say which one with --padding");
-  }
-  EXPECT_EQ(operation_parameters(authorizations{}.padding({KM_PAD_RSA_PSS}), key),
-            authorizations{}.padding({KM_PAD_RSA_PSS}).digest({KM_DIGEST_SHA_2_256}));
-  EXPECT_THROW((void)operation_parameters({}, rsa_2048), usage_error);
-}
-
-TEST(OperationParameters, RawPaddingTakesNoDigestWhateverTheKeyLists) {
-  const auto key = authorizations(rsa_2048).padding({KM_PAD_NONE}).digest({KM_DIGEST_SHA_2_256, KM_DIGEST_NONE});
-  EXPECT_EQ(operation_parameters({}, key), authorizations{}.padding({KM_PAD_NONE}).digest({KM_DIGEST_NONE}));
-}
-
-TEST(OperationParameters, OtherAlgorithmsNeedWhatTheyNeed) {
-  EXPECT_EQ(operation_parameters({}, authorizations{}.algorithm(KM_ALGORITHM_EC).digest({KM_DIGEST_SHA_2_256})),
-            authorizations{}.digest({KM_DIGEST_SHA_2_256}));
-  EXPECT_EQ(operation_parameters(
-                {}, authorizations{}.algorithm(KM_ALGORITHM_HMAC).digest({KM_DIGEST_SHA_2_256}).min_mac_length(128)),
-            authorizations{}.mac_length(128));
+  EXPECT_THROW(parse(option_use::operation, "--block-mode gcm"), CLI::ParseError);
 }
 
 TEST(Describe, GroupsRepeatedTagsAndNamesValues) {
@@ -165,7 +204,7 @@ TEST(CommandLine, EverySubCommandTeaches) {
   context ctx;
   const auto app = make_application(ctx);
   const auto commands = app->get_subcommands([](const CLI::App*) { return true; });
-  ASSERT_EQ(commands.size(), 10U);
+  ASSERT_EQ(commands.size(), 12U);
   for (const CLI::App* const command : commands) {
     EXPECT_FALSE(command->get_description().empty());
     EXPECT_NE(command->get_footer().find("kmctl " + command->get_name()), std::string::npos) << command->get_name();
@@ -178,6 +217,7 @@ TEST(CommandLine, EverySubCommandTeaches) {
 TEST(OpensslCommand, IsPrintedAsAShellTakesIt) {
   EXPECT_EQ(command_line({"openssl", "a b", "it's", "", "x=/y"}), "openssl 'a b' 'it'\\''s' '' x=/y");
   EXPECT_EQ(verify_command("p.pem", "s", "-f").back(), "./-f");
+  EXPECT_EQ(command_line(mac_command("00ff", "-f")), "openssl dgst -sha256 -mac HMAC -macopt hexkey:00ff ./-f");
 }
 
 TEST(OpensslCommand, GivesStatusAndOutput) {

@@ -3,6 +3,8 @@
 #include <gtest/gtest.h>
 
 #include <set>
+#include <string>
+#include <vector>
 
 #include "client/lib/error.h"
 #include "src/params/keymaster_protocol.h"
@@ -84,7 +86,81 @@ TEST(Errors, AdviceDependsOnTheStep) {
   };
   EXPECT_NE(hint("begin", KM_ERROR_INVALID_ARGUMENT), hint("generate_key", KM_ERROR_INVALID_ARGUMENT));
   EXPECT_FALSE(hint("update", KM_ERROR_INVALID_ARGUMENT).empty());
-  EXPECT_TRUE(hint("begin", -7777).empty());
+}
+
+const std::string in_the_trace = hint_for({.kind = error_kind::keymaster, .step = "begin", .keymaster_error = -7777});
+
+TEST(Errors, WhatNobodyKnowsIsLookedForInTheTrace) {
+  EXPECT_NE(in_the_trace.find("KEYMASTER_TRACE=error"), std::string::npos);
+  EXPECT_EQ(hint_for({.kind = error_kind::tee, .step = "begin", .tee_result = 0x12345678}), in_the_trace);
+}
+
+std::vector<std::string> all_steps() {
+  std::vector<std::string> steps{"connect", "open_session"};
+  for (std::uint32_t command = 0; command < 64; ++command) {
+    if (const std::string name = command_name(command); !name.starts_with("command(")) {
+      steps.push_back(name);
+    }
+  }
+  return steps;
+}
+
+// A client meets a Keymaster error with any command.
+TEST(Errors, EveryKeymasterErrorHasAHintOfItsOwn) {
+  std::size_t found = 0;
+  for (std::int32_t code = -1; code >= -1000; --code) {
+    const std::string name = keymaster_error_name(code);
+    for (const std::string& step : all_steps()) {
+      if (name.starts_with("KM_ERROR(") || (code == KM_ERROR_UNKNOWN_ERROR && step != "finish")) {
+        continue;  // an unknown error is one that only the trace can tell more about
+      }
+      const std::string hint = hint_for({.kind = error_kind::keymaster, .step = step, .keymaster_error = code});
+      EXPECT_NE(hint, in_the_trace) << step << ": " << name;
+      EXPECT_FALSE(hint.empty());
+      ++found;
+    }
+  }
+  EXPECT_GT(found, 400U);
+}
+
+// The results that the Client API, the hosted TEE and the TA are known to answer, and when.
+TEST(Errors, EveryResultThatAClientMeetsHasAHintOfItsOwn) {
+  struct row {
+    const char* step;
+    std::vector<std::uint32_t> results;
+  };
+  constexpr std::uint32_t storage_no_space = 0xFFFF3041;
+  constexpr std::uint32_t mac_invalid = 0xFFFF3071;
+  constexpr std::uint32_t ksk_deleted = 0xF0100001;
+  constexpr std::uint32_t ksk_rpmb_gone = 0xF0100003;
+  for (const auto& [step, results] : std::vector<row>{
+           {"connect",
+            {TEEC_ERROR_BUSY, TEEC_ERROR_BAD_STATE, TEEC_ERROR_SECURITY, TEEC_ERROR_BAD_FORMAT,
+             TEEC_ERROR_BAD_PARAMETERS, TEEC_ERROR_GENERIC, TEEC_ERROR_OUT_OF_MEMORY}},
+           {"open_session",
+            {TEEC_ERROR_ITEM_NOT_FOUND, TEEC_ERROR_BAD_FORMAT, storage_no_space, TEEC_ERROR_OUT_OF_MEMORY, ksk_deleted,
+             TEEC_ERROR_TARGET_DEAD, TEEC_ERROR_BUSY}},
+           {"begin",
+            {mac_invalid, ksk_rpmb_gone, TEEC_ERROR_TARGET_DEAD, TEEC_ERROR_OUT_OF_MEMORY, TEEC_ERROR_BUSY,
+             TEEC_ERROR_NOT_SUPPORTED, TEEC_ERROR_BAD_PARAMETERS, TEEC_ERROR_SHORT_BUFFER}},
+           {"generate_key",
+            {TEEC_ERROR_BAD_PARAMETERS, TEEC_ERROR_NOT_SUPPORTED, TEEC_ERROR_OUT_OF_MEMORY, TEEC_ERROR_SHORT_BUFFER,
+             storage_no_space, TEEC_ERROR_NOT_IMPLEMENTED}},
+           {"finish", {TEEC_ERROR_BAD_PARAMETERS, TEEC_ERROR_OUT_OF_MEMORY, TEEC_ERROR_TARGET_DEAD}},
+       }) {
+    for (const std::uint32_t result : results) {
+      const std::string hint = hint_for({.kind = error_kind::tee, .step = step, .tee_result = result});
+      EXPECT_NE(hint, in_the_trace) << step << ": " << tee_result_name(result);
+    }
+  }
+}
+
+TEST(Errors, ADamagedStateOrImageIsToldByItsFile) {
+  const auto hint = [](const char* step) {
+    return hint_for({.kind = error_kind::connection, .step = step, .tee_result = TEEC_ERROR_BAD_FORMAT});
+  };
+  EXPECT_NE(hint("connect").find("settings"), std::string::npos);
+  EXPECT_NE(hint("open_session").find(".ta"), std::string::npos);
 }
 
 }  // namespace

@@ -1,0 +1,87 @@
+"""What the tests of kmctl share: a folder and a device for each test, kmctl and openssl as functions."""
+
+import json
+import os
+import subprocess
+import sys
+import tempfile
+import unittest
+
+DONE, FAILURE, USAGE, TEE_ERROR, KEYMASTER, NO_CONNECTION, INVALID = range(7)
+
+# The words of kmctl and of openssl for the same digest.
+DIGESTS = {"md5": "md5", "sha-1": "sha1", "sha-224": "sha224", "sha-256": "sha256", "sha-384": "sha384",
+           "sha-512": "sha512"}
+
+
+def openssl(*arguments, data=None, check=True):
+    return subprocess.run(["openssl", *arguments], input=data, capture_output=True, check=check)
+
+
+class KmctlTest(unittest.TestCase):
+    program = ""  # kmctl
+    shared_state = None  # a device that tests may share which only need some device
+
+    def setUp(self):
+        folder = tempfile.TemporaryDirectory(prefix="kmctl-test-")
+        self.addCleanup(folder.cleanup)
+        self.folder = folder.name
+        self.state = self.shared_state
+        self.data = self.write("letter.txt", b"Dear reader,\n" * 20000)  # several chunks of 64 KiB
+
+    def path(self, name):
+        return os.path.join(self.folder, name)
+
+    def write(self, name, content):
+        with open(self.path(name), "wb") as file:
+            file.write(content)
+        return self.path(name)
+
+    def read(self, name):
+        with open(self.path(name), "rb") as file:
+            return file.read()
+
+    def environment(self, **extra):
+        kept = {k: v for k, v in os.environ.items() if not k.startswith("KEYMASTER_") or k == "KEYMASTER_TA_PATH"}
+        # A sanitizer's finding must not pass for an exit code of kmctl.
+        findings = {"ASAN_OPTIONS": "exitcode=99", "UBSAN_OPTIONS": "exitcode=99", "LSAN_OPTIONS": "exitcode=99"}
+        return {**kept, **findings, "KEYMASTER_STATE": self.state, **extra}
+
+    def kmctl(self, *arguments, expect=DONE, data=b"", **extra):
+        """Runs kmctl and asserts its exit code."""
+        result = subprocess.run([self.program, *arguments], input=data, capture_output=True, env=self.environment(**extra),
+                                cwd=self.folder, check=False)
+        self.assertEqual(result.returncode, expect, f"kmctl {arguments}: {result.stdout!r} {result.stderr!r}")
+        if expect not in (DONE,) and "--json" not in arguments:
+            self.assertTrue(result.stderr, f"kmctl {arguments} failed without a word")
+        return result
+
+    def json(self, *arguments, **how):
+        return json.loads(self.kmctl(*arguments, "--json", **how).stdout)
+
+    def generate(self, *arguments, name="key.blob"):
+        self.kmctl("generate", *arguments, self.path(name))
+        return self.path(name)
+
+    def public_key(self, blob, name="public.pem"):
+        self.kmctl("export", blob, "-o", self.path(name))
+        return self.path(name)
+
+    def flipped(self, source, offset, name):
+        content = bytearray(self.read(source))
+        content[offset] ^= 1
+        return self.write(name, bytes(content))
+
+    def assert_folder_holds(self, *names):
+        """Nothing is left behind but these, and what setUp made."""
+        self.assertEqual(sorted(os.listdir(self.folder)), sorted([*names, "letter.txt"]))
+
+
+def main(usage):
+    """Runs the tests of the calling script: SCRIPT KMCTL [unittest arguments]."""
+    if len(sys.argv) < 2:
+        sys.exit(usage)
+    KmctlTest.program = os.path.abspath(sys.argv.pop(1))
+    with tempfile.TemporaryDirectory(prefix="kmctl-device-") as folder:
+        KmctlTest.shared_state = os.path.join(folder, "state")
+        unittest.main(argv=sys.argv, verbosity=1)
