@@ -9,7 +9,7 @@ set(CMAKE_CXX_SCAN_FOR_MODULES OFF)
 
 add_library(keymaster_options INTERFACE)
 target_compile_options(keymaster_options INTERFACE
-  -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wcast-align -Wundef -Wvla -Wformat=2 -Werror
+  -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wcast-align -Wundef -Wvla -Werror
   $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor -Woverloaded-virtual -Wold-style-cast>
   $<$<COMPILE_LANGUAGE:C>:-Wstrict-prototypes>)
 

@@ -6,8 +6,9 @@ target_link_libraries(keymaster_ta_options INTERFACE keymaster_options)
 add_library(keymaster_ta_headers INTERFACE)
 target_include_directories(keymaster_ta_headers INTERFACE "${PROJECT_SOURCE_DIR}/tee/include")
 target_link_libraries(keymaster_ta_options INTERFACE keymaster_ta_headers)
+# -Wformat=2: a trace format is a literal at its place, so that no client's bytes can ever become one.
 target_compile_options(keymaster_ta_options INTERFACE
-  -fno-exceptions -fno-rtti -fno-threadsafe-statics -fno-use-cxa-atexit
+  -Wformat=2 -fno-exceptions -fno-rtti -fno-threadsafe-statics -fno-use-cxa-atexit
   -fvisibility=hidden -fvisibility-inlines-hidden -ffunction-sections -fdata-sections
   -fno-stack-protector -U_FORTIFY_SOURCE -fmacro-prefix-map=${PROJECT_SOURCE_DIR}/=)
 

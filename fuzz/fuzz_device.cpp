@@ -7,7 +7,10 @@
 #include <string>
 
 #include "src/params/keymaster_protocol.h"
+#include "ta/ta_limits.h"
 #include "tee/runtime/builtin_ta.h"
+#include "tee/runtime/device.h"
+#include "tee/runtime/instance_scope.h"
 #include "tee_ta_image.h"
 
 namespace fuzzing {
@@ -47,6 +50,16 @@ void require(bool holds, const char* invariant) {
   if (holds) return;
   std::fprintf(stderr, "invariant broken: %s\n", invariant);
   std::abort();
+}
+
+void in_fresh_instance(const std::function<void(hosted_tee::instance& instance)>& body) {
+  static auto* const device = new hosted_tee::device_services;  // lives as long as the process
+  hosted_tee::instance instance(ta_uuid, keymaster::ta_heap_size, *device, device->faults);
+  const hosted_tee::instance_scope scope(instance);
+  body(instance);
+  require(instance.objects.size() == 0, "no key object stays");
+  require(instance.heap.blocks() == 0, "nothing stays on the heap");
+  device->trace.clear();
 }
 
 fuzz_device::fuzz_device() {

@@ -3,9 +3,11 @@
 #define FUZZ_FUZZ_DEVICE_H_
 
 #include <array>
+#include <functional>
 #include <optional>
 
 #include "fuzz/input_reader.h"
+#include "tee/runtime/instance.h"
 #include "tee/runtime/secure_world.h"
 
 namespace fuzzing {
@@ -31,6 +33,10 @@ struct reply {
 
   [[nodiscard]] bool ok() const { return result == TEE_SUCCESS && a == 0; }
 };
+
+/// in_fresh_instance runs `body` where the TA's own functions can be called: with an instance to allocate from, in
+/// which nothing may stay.
+void in_fresh_instance(const std::function<void(hosted_tee::instance& instance)>& body);
 
 /// A device for the life of the process, with a fresh instance of the TA for each session.
 class fuzz_device {

@@ -11,18 +11,12 @@
 #include "algorithms/rsa/rsa_key.h"
 #include "algorithms/rsa/rsa_key_data.h"
 #include "fuzz/fuzz_device.h"
-#include "src/params/keymaster_protocol.h"
-#include "ta/ta_limits.h"
-#include "tee/runtime/device.h"
-#include "tee/runtime/instance.h"
-#include "tee/runtime/instance_scope.h"
 
 using namespace keymaster;
 
 namespace fuzzing {
 namespace {
 
-constexpr TEE_UUID ta_uuid = KEYMASTER_TA_UUID;
 using key_bytes = std::span<const uint8_t>;
 
 TEE_Result resolve_hmac(key_bytes data, TEE_ObjectHandle* key, uint32_t* bits, keymaster_error_t* error) {
@@ -88,10 +82,7 @@ void check_import(const key_module& module, key_bytes material, uint32_t digest)
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace fuzzing;
-  static auto* const device = new hosted_tee::device_services;  // lives as long as the process
-  hosted_tee::instance instance(ta_uuid, ta_heap_size, *device, device->faults);
-  const hosted_tee::instance_scope scope(instance);
-  {
+  in_fresh_instance([&](hosted_tee::instance&) {
     input_reader in({data, size});
     const key_module& module = in.pick(modules);
     const auto digest = static_cast<uint32_t>(in.below(8));
@@ -102,9 +93,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     check_resolve(module, {body.get(), rest.size()});
     check_export(module, {body.get(), rest.size()}, capacity);
     check_import(module, {body.get(), rest.size()}, digest);
-  }
-  require(instance.objects.size() == 0, "no key object stays");
-  require(instance.heap.blocks() == 0, "nothing stays on the heap");
-  device->trace.clear();
+  });
   return 0;
 }

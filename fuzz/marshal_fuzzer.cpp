@@ -5,18 +5,12 @@
 
 #include "fuzz/fuzz_device.h"
 #include "params/marshal.h"
-#include "src/params/keymaster_protocol.h"
 #include "ta/ta_limits.h"
-#include "tee/runtime/device.h"
-#include "tee/runtime/instance.h"
-#include "tee/runtime/instance_scope.h"
 
 using namespace keymaster;
 
 namespace fuzzing {
 namespace {
-
-constexpr TEE_UUID ta_uuid = KEYMASTER_TA_UUID;
 
 bool same_record(const keymaster_key_param_t& a, const keymaster_key_param_t& b) {
   if (a.tag != b.tag) return false;
@@ -74,10 +68,7 @@ void check_slot(const keymaster_key_param_set_t& set, std::size_t capacity) {
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace fuzzing;
-  static auto* const device = new hosted_tee::device_services;  // lives as long as the process
-  hosted_tee::instance instance(ta_uuid, ta_heap_size, *device, device->faults);
-  const hosted_tee::instance_scope scope(instance);
-  {
+  in_fresh_instance([&](hosted_tee::instance& instance) {
     input_reader in({data, size});
     const std::size_t capacity = in.number(2) % 1024;
     const bytes rest = in.take(size);
@@ -94,8 +85,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     } else {
       require(set.params == nullptr && set.length == 0, "a set that doesn't unmarshal is empty");
     }
-  }
-  require(instance.heap.blocks() == 0, "nothing stays on the heap");
-  device->trace.clear();
+  });
   return 0;
 }

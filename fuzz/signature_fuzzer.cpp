@@ -8,18 +8,12 @@
 
 #include "algorithms/ec/ec_signature_der.h"
 #include "fuzz/fuzz_device.h"
-#include "src/params/keymaster_protocol.h"
-#include "ta/ta_limits.h"
-#include "tee/runtime/device.h"
-#include "tee/runtime/instance.h"
-#include "tee/runtime/instance_scope.h"
 
 using namespace keymaster;
 
 namespace fuzzing {
 namespace {
 
-constexpr TEE_UUID ta_uuid = KEYMASTER_TA_UUID;
 constexpr std::array<std::size_t, 5> field_sizes = {24, 28, 32, 48, 66};
 
 bool is_zero(const bytes& number) {
@@ -61,13 +55,10 @@ void check(const bytes& der, std::size_t field_size) {
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace fuzzing;
-  static auto* const device = new hosted_tee::device_services;  // lives as long as the process
-  hosted_tee::instance instance(ta_uuid, ta_heap_size, *device, device->faults);
-  const hosted_tee::instance_scope scope(instance);
-  input_reader in({data, size});
-  const std::size_t field_size = in.pick(field_sizes);
-  check(in.take(size), field_size);
-  require(instance.heap.blocks() == 0, "nothing stays on the heap");
-  device->trace.clear();
+  in_fresh_instance([&](hosted_tee::instance&) {
+    input_reader in({data, size});
+    const std::size_t field_size = in.pick(field_sizes);
+    check(in.take(size), field_size);
+  });
   return 0;
 }

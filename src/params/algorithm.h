@@ -24,6 +24,10 @@ inline constexpr int parameter_not_applicable = 1;
 using operation_constructor = keymaster_operation_t* (*)(const operation_request& request, TEE_Result* result,
                                                          keymaster_error_t* error);
 
+/// A parameter_reader answers what `params` ask for: parameter_found and the value, or parameter_not_applicable and the
+/// value untouched.
+using parameter_reader = int (*)(const keymaster_key_param_set_t& params, uint32_t* value);
+
 /// What an algorithm offers for one purpose.
 struct keymaster_purpose_ops {
   uint32_t (*get_support_block_mode_cnt)();
@@ -35,10 +39,9 @@ struct keymaster_purpose_ops {
 
   operation_constructor create_operation;
 
-  /// What `params` ask for: parameter_found and the value, or parameter_not_applicable and the value untouched.
-  int (*get_padding)(const keymaster_key_param_set_t& params, uint32_t* padding);
-  int (*get_block_mode)(const keymaster_key_param_set_t& params, uint32_t* block_mode);
-  int (*get_digest)(const keymaster_key_param_set_t& params, uint32_t* digest);
+  parameter_reader get_padding;
+  parameter_reader get_block_mode;
+  parameter_reader get_digest;
 };
 
 struct keymaster_algorithm_descriptor {
@@ -72,6 +75,24 @@ struct constant_list {
     if constexpr (List.size() != 0) std::memcpy(static_cast<void*>(values), List.data(), sizeof List);
   }
 };
+
+/// make_purpose_ops puts a purpose's record together from its lists, its constructor and its readers.
+template <const auto& BlockModes, const auto& Paddings, const auto& Digests>
+constexpr keymaster_purpose_ops make_purpose_ops(operation_constructor create, parameter_reader padding,
+                                                 parameter_reader block_mode, parameter_reader digest) {
+  return {
+      .get_support_block_mode_cnt = constant_list<BlockModes>::count,
+      .get_support_block_mode = constant_list<BlockModes>::copy,
+      .get_support_padding_mode_cnt = constant_list<Paddings>::count,
+      .get_support_padding_mode = constant_list<Paddings>::copy,
+      .get_support_digest_cnt = constant_list<Digests>::count,
+      .get_support_digest = constant_list<Digests>::copy,
+      .create_operation = create,
+      .get_padding = padding,
+      .get_block_mode = block_mode,
+      .get_digest = digest,
+  };
+}
 
 /// never_applicable is the answer of an algorithm without paddings or without block modes.
 inline int never_applicable(const keymaster_key_param_set_t& /*params*/, uint32_t* /*value*/) {

@@ -34,23 +34,9 @@ int aes_get_padding(const keymaster_key_param_set_t& params, uint32_t* padding) 
   return parameter_found;
 }
 
-int aes_get_digest(const keymaster_key_param_set_t&, uint32_t*) {
-  return parameter_not_applicable;
-}
-
 constexpr keymaster_purpose_ops cipher_ops(operation_constructor create) {
-  return {
-      .get_support_block_mode_cnt = constant_list<block_modes>::count,
-      .get_support_block_mode = constant_list<block_modes>::copy,
-      .get_support_padding_mode_cnt = constant_list<paddings>::count,
-      .get_support_padding_mode = constant_list<paddings>::copy,
-      .get_support_digest_cnt = constant_list<digests>::count,
-      .get_support_digest = constant_list<digests>::copy,
-      .create_operation = create,
-      .get_padding = aes_get_padding,
-      .get_block_mode = aes_get_block_mode,
-      .get_digest = aes_get_digest,
-  };
+  return make_purpose_ops<block_modes, paddings, digests>(create, aes_get_padding, aes_get_block_mode,
+                                                          never_applicable);
 }
 
 constexpr keymaster_purpose_ops encrypt_ops = cipher_ops(create_aes_encrypt);

@@ -16,18 +16,7 @@ constexpr std::array<uint32_t, 1> import_formats = {KM_KEY_FORMAT_RAW};
 constexpr std::array<uint32_t, 0> export_formats = {};
 
 constexpr keymaster_purpose_ops mac_ops(operation_constructor create) {
-  return {
-      .get_support_block_mode_cnt = constant_list<block_modes>::count,
-      .get_support_block_mode = constant_list<block_modes>::copy,
-      .get_support_padding_mode_cnt = constant_list<paddings>::count,
-      .get_support_padding_mode = constant_list<paddings>::copy,
-      .get_support_digest_cnt = constant_list<digests>::count,
-      .get_support_digest = constant_list<digests>::copy,
-      .create_operation = create,
-      .get_padding = never_applicable,
-      .get_block_mode = never_applicable,
-      .get_digest = unique_digest,
-  };
+  return make_purpose_ops<block_modes, paddings, digests>(create, never_applicable, never_applicable, unique_digest);
 }
 
 constexpr keymaster_purpose_ops sign_ops = mac_ops(create_hmac_sign);

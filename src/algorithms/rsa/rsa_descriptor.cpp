@@ -42,18 +42,7 @@ int rsa_get_digest(const keymaster_key_param_set_t& params, uint32_t* digest) {
 
 template <const auto& Paddings, const auto& Digests>
 constexpr keymaster_purpose_ops purpose_ops(operation_constructor create) {
-  return {
-      .get_support_block_mode_cnt = constant_list<block_modes>::count,
-      .get_support_block_mode = constant_list<block_modes>::copy,
-      .get_support_padding_mode_cnt = constant_list<Paddings>::count,
-      .get_support_padding_mode = constant_list<Paddings>::copy,
-      .get_support_digest_cnt = constant_list<Digests>::count,
-      .get_support_digest = constant_list<Digests>::copy,
-      .create_operation = create,
-      .get_padding = rsa_get_padding,
-      .get_block_mode = never_applicable,
-      .get_digest = rsa_get_digest,
-  };
+  return make_purpose_ops<block_modes, Paddings, Digests>(create, rsa_get_padding, never_applicable, rsa_get_digest);
 }
 
 /// A record's place is the purpose's value.
