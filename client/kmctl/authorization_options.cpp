@@ -191,7 +191,7 @@ authorizations rsa_use(const authorizations& given) {
     use.purpose({KM_PURPOSE_ENCRYPT, KM_PURPOSE_DECRYPT});
   }
   // Without a padding, and with this one, there is nothing to digest: a digest would make such a key unusable.
-  const auto padding = given.unique_number(KM_TAG_PADDING);
+  const std::uint64_t padding = given.unique_number(KM_TAG_PADDING).value_or(KM_PAD_RSA_OAEP);
   const bool bare = padding == KM_PAD_NONE || padding == KM_PAD_RSA_PKCS1_1_5_ENCRYPT;
   use.digest({bare ? KM_DIGEST_NONE : KM_DIGEST_SHA_2_256});
   if (signs) {

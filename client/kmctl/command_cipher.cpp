@@ -19,7 +19,6 @@ namespace kmctl {
 namespace {
 
 namespace client = keymaster::client;
-using client::authorizations;
 using client::byte_view;
 
 constexpr const char* encrypt_examples =

@@ -101,7 +101,7 @@ bytes import_mac_key(demonstration& demo, bytes& blob) {
 }
 
 std::string compare_macs(const demonstration& demo, byte_view key, byte_view mac) {
-  const std::string told = demonstration::by_openssl(mac_command(to_hex(key), demo.file()), "compute the MAC");
+  std::string told = demonstration::by_openssl(mac_command(to_hex(key), demo.file()), "compute the MAC");
   if (!told.ends_with(to_hex(mac))) {
     throw failure_error(fmt::format("openssl computes another MAC:\n{}", told));
   }

@@ -69,7 +69,7 @@ maybe encryption_digest(const choice& from) {
 
 /// CTR and GCM work on text of any length.
 maybe block_padding(const choice& from) {
-  const maybe mode = from.chosen.unique_number(KM_TAG_BLOCK_MODE);
+  const std::uint64_t mode = from.chosen.unique_number(KM_TAG_BLOCK_MODE).value_or(0);
   return mode == KM_MODE_CTR || mode == KM_MODE_GCM ? maybe(KM_PAD_NONE)
                                                     : only<KM_TAG_PADDING, KM_PAD_NONE, KM_PAD_PKCS7>(from);
 }
