@@ -45,6 +45,14 @@ void write_integer(uint8_t** position, std::span<const uint8_t> value) {
   *position += value.size();
 }
 
+/// Steps over a tag that was looked at, and reads the length behind it.
+bool read_length(const uint8_t** position, const uint8_t* end, uint32_t* length) {
+  ++*position;
+  if (der_decode_length(position, end, length) == 0) return true;
+  TRACE_ERROR("Decode length failed");
+  return false;
+}
+
 /// Reads tag, length and content of an INTEGER, and drops one sign byte.
 bool read_integer(const uint8_t** position, const uint8_t* end, std::span<const uint8_t>& value) {
   if (*position == end) {
@@ -55,12 +63,8 @@ bool read_integer(const uint8_t** position, const uint8_t* end, std::span<const 
     TRACE_ERROR("Wrong tag, expect 0x02, got 0x%02x", **position);
     return false;
   }
-  ++*position;
   uint32_t length = 0;
-  if (der_decode_length(position, end, &length) != 0) {
-    TRACE_ERROR("Decode length failed");
-    return false;
-  }
+  if (!read_length(position, end, &length)) return false;
   const uint32_t available = static_cast<uint32_t>(end - *position);
   if (length > available) {
     TRACE_ERROR("Wrong length of integer, %dB available, got %dB", available, length);
@@ -87,12 +91,8 @@ bool read_sequence(const uint8_t** position, const uint8_t* end) {
     TRACE_ERROR("Wrong tag, expect 0x30, got 0x%02x", **position);
     return false;
   }
-  ++*position;
   uint32_t length = 0;
-  if (der_decode_length(position, end, &length) != 0) {
-    TRACE_ERROR("Decode length failed");
-    return false;
-  }
+  if (!read_length(position, end, &length)) return false;
   const uint32_t remaining = static_cast<uint32_t>(end - *position);
   if (length != remaining) {
     TRACE_ERROR("Wrong length of sequence, expect %dB, got %dB", remaining, length);
