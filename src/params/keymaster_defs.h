@@ -56,6 +56,19 @@ inline constexpr keymaster_tag_t KM_TAG_AUTH_TOKEN = KM_BYTES | 1002;
 inline constexpr keymaster_tag_t KM_TAG_MAC_LENGTH = KM_UINT | 1003;
 /// A tag of this system's own: the key belongs to the soter attestation framework. Its presence counts, not its value.
 inline constexpr keymaster_tag_t KM_TAG_SOTER_KEY = KM_BOOL | 11000;
+/// What goes with it. The export statement of the key is signed by the device's attestation key, or else by a key whose
+/// blob is given; the statement tells the counter, and the uid that the key was made for.
+inline constexpr keymaster_tag_t KM_TAG_SOTER_SIGNED_BY_ATTK = KM_BOOL | 11001;
+inline constexpr keymaster_tag_t KM_TAG_SOTER_SIGNED_BY_KEY = KM_BOOL | 11002;
+/// The signing key's blob where KM_TAG_SOTER_SIGNING_KEY_BLOB is absent, although it is called a name.
+inline constexpr keymaster_tag_t KM_TAG_SOTER_SIGNING_KEY_NAME = KM_BYTES | 11003;
+inline constexpr keymaster_tag_t KM_TAG_SOTER_COUNTED = KM_BOOL | 11004;
+inline constexpr keymaster_tag_t KM_TAG_SOTER_UID = KM_UINT | 11007;
+inline constexpr keymaster_tag_t KM_TAG_SOTER_SIGNING_KEY_BLOB = KM_BYTES | 11008;
+static_assert(KM_TAG_SOTER_KEY == 0x70002AF8 && KM_TAG_SOTER_SIGNED_BY_ATTK == 0x70002AF9 &&
+              KM_TAG_SOTER_SIGNED_BY_KEY == 0x70002AFA && KM_TAG_SOTER_SIGNING_KEY_NAME == 0x90002AFB &&
+              KM_TAG_SOTER_COUNTED == 0x70002AFC && KM_TAG_SOTER_UID == 0x30002AFF &&
+              KM_TAG_SOTER_SIGNING_KEY_BLOB == 0x90002B00);
 
 enum keymaster_algorithm_t : uint32_t {
   KM_ALGORITHM_RSA = 1,

@@ -45,6 +45,18 @@ enum keymaster_command_t : uint32_t {
   KM_COMMAND_SOTER_SET_FID = 0xFF04,
 };
 
+/// What the soter commands answer in slot 0 beside the Keymaster errors. The numbers overlap with those, so a client
+/// reads them by the command that it sent.
+enum soter_status_t : int32_t {
+  SOTER_STATUS_OK = 0,
+  SOTER_STATUS_NO_ATTK = -1,          ///< no attestation key is provisioned, or (export) it can't be loaded
+  SOTER_STATUS_UNREADABLE_ATTK = -2,  ///< there may be one, and reading it failed
+};
+
+/// What the fingerprint TA sends with KM_COMMAND_SOTER_SET_FID: u32 version, u32 finger id, u64 system time in ms.
+inline constexpr uint32_t SOTER_FID_MESSAGE_SIZE = 16;
+inline constexpr uint32_t SOTER_FID_MESSAGE_VERSION = 0;
+
 }  // namespace keymaster
 
 #endif  // KEYMASTER_PARAMS_KEYMASTER_PROTOCOL_H_

@@ -68,6 +68,14 @@ class persistent_object : public basic_handle<TEE_ObjectHandle, TEE_CloseObject>
     if (result != TEE_SUCCESS) handle_ = TEE_HANDLE_NULL;
     return result;
   }
+
+  /// read reads up to `size` bytes from where the object stands; `*count` tells how many came. Without an object it is
+  /// TEE_ERROR_BAD_PARAMETERS: the platform would end the instance for a null handle.
+  [[nodiscard]] TEE_Result read(void* bytes, uint32_t size, uint32_t* count) const {
+    *count = 0;
+    if (handle_ == TEE_HANDLE_NULL) return TEE_ERROR_BAD_PARAMETERS;
+    return TEE_ReadObjectData(handle_, bytes, size, count);
+  }
 };
 
 /// operation_handle owns a cryptographic operation.
@@ -81,6 +89,26 @@ class operation_handle : public basic_handle<TEE_OperationHandle, TEE_FreeOperat
     const TEE_Result result = TEE_AllocateOperation(&handle_, algorithm, mode, max_key_size);
     if (result != TEE_SUCCESS) handle_ = TEE_HANDLE_NULL;
     return result;
+  }
+};
+
+/// ta_session owns a session to another TA.
+class ta_session : public basic_handle<TEE_TASessionHandle, TEE_CloseTASession> {
+ public:
+  using basic_handle::basic_handle;
+
+  /// open opens a session without parameters. On failure the owner is empty and the platform's result comes back.
+  [[nodiscard]] TEE_Result open(const TEE_UUID& destination) {
+    reset();
+    TEE_Param unused[4] = {};
+    const TEE_Result result =
+        TEE_OpenTASession(&destination, TEE_TIMEOUT_INFINITE, TEE_PARAM_TYPES(0, 0, 0, 0), unused, &handle_, nullptr);
+    if (result != TEE_SUCCESS) handle_ = TEE_HANDLE_NULL;
+    return result;
+  }
+
+  [[nodiscard]] TEE_Result invoke(uint32_t command, uint32_t param_types, TEE_Param params[4]) const {
+    return TEE_InvokeTACommand(handle_, TEE_TIMEOUT_INFINITE, command, param_types, params, nullptr);
   }
 };
 

@@ -9,6 +9,7 @@
 const char tee_trace_prefix[] = "KEYMASTER";
 
 TEE_Result TA_CreateEntryPoint(void) {
+  keymaster::soter_start();
   if (TEE_Result r = keymaster::key_store_init(); r != TEE_SUCCESS) {
     TRACE_ERROR("Init key store failed");
     return r;
@@ -28,7 +29,7 @@ TEE_Result TA_CreateEntryPoint(void) {
 
 void TA_DestroyEntryPoint(void) {
   keymaster::authorizaiton_release();
-  if (keymaster::soter_ready()) keymaster::soter_release();
+  if (keymaster::soter_ready()) keymaster::soter_release_resources();
 }
 
 TEE_Result TA_OpenSessionEntryPoint(uint32_t /*paramTypes*/, TEE_Param /*params*/[4], void** /*sessionContext*/) {

@@ -126,7 +126,7 @@ TEE_Result export_key(std::span<const uint8_t> request, std::span<uint8_t> respo
   }
   TRACE_DEBUG("soter export_key\n");
   *response_length = static_cast<uint32_t>(response.size());
-  return soter_enhance_export_key(key_data.span(), characteristics, response.data(), response_length);
+  return soter_enhance_export_key(characteristics, key_data.span(), response.data(), response_length);
 }
 
 TEE_Result delete_key(std::span<const uint8_t> request, keymaster_error_t* error) {

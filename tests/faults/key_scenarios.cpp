@@ -196,7 +196,7 @@ std::vector<scenario> reading_scenarios() {
        {},
        [](stage& on) { return on.client().export_key(on.blob); },
        {},
-       TEEC_ERROR_NOT_IMPLEMENTED,
+       TEEC_ERROR_BAD_PARAMETERS,
        KM_ERROR_UNKNOWN_ERROR},
       {"delete", fixed_key, {}, [](stage& on) { return on.client().delete_key(on.blob); }},
       {"delete_of_no_blob",

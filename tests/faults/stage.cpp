@@ -9,6 +9,29 @@ namespace {
 constexpr std::uint64_t user = 77;
 }
 
+void stage::provision() {
+  quil.provision(rsa_test_key::of_bits(2048).components());
+  tee.world().device().other_tas = &quil;
+}
+
+// The message has no slot for a status: its result tells all.
+answer stage::notify(const bytes& fid_message) {
+  hosted_tee::secure_world& world = tee.world();
+  bytes body = fid_message;
+  std::uint32_t session = 0;
+  answer told;
+  TEE_Param none[4] = {}, slots[4] = {};
+  slots[1].memref = {body.data(), static_cast<std::uint32_t>(body.size())};
+  told.result =
+      world.open_session(keymaster_ta, {TEE_LOGIN_TRUSTED_APP, fingerprint_ta}, 0, none, session, told.origin);
+  if (told.result != TEE_SUCCESS) return told;
+  told.result = world.invoke(session, KM_COMMAND_SOTER_SET_FID, TEE_PARAM_TYPES(0, TEE_PARAM_TYPE_MEMREF_INPUT, 0, 0),
+                             slots, told.origin);
+  world.close_session(session);
+  told.error = told.result == TEE_SUCCESS ? KM_ERROR_OK : KM_ERROR_UNKNOWN_ERROR;
+  return told;
+}
+
 void stage::import(const param_list& list) {
   blob = client().must_import(list, key.material());
 }

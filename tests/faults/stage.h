@@ -8,6 +8,7 @@
 
 #include "src/params/keymaster_defs.h"
 #include "tests/support/device_fixture.h"
+#include "tests/support/played_quil.h"
 #include "tests/support/rsa_test_key.h"
 
 namespace testing_support {
@@ -16,6 +17,7 @@ namespace testing_support {
 struct stage {
   explicit stage(bool rpmb) : tee(rpmb) {}
 
+  played_quil quil;  // answers nothing unless provision() is called
   device tee;
   const rsa_test_key& key = rsa_test_key::of_bits(1024);
   bytes blob;         // the key that the command is about
@@ -26,6 +28,10 @@ struct stage {
   std::vector<std::uint32_t> fillers;  // operations that only take up room
 
   ta_client& client() { return tee.client(); }
+
+  /// provision puts a provisioning TA there that has everything. notify sends a message as the device's fingerprint TA.
+  void provision();
+  answer notify(const bytes& fid_message);
 
   /// import makes `blob` from the fixed key; without `list` a key for every kind of signature.
   void import(const param_list& list);
@@ -57,7 +63,9 @@ struct scenario {
   bool zeroes_response = false;  // on failure, over the whole capacity
   bool rpmb = true;
   bool begins = false;                // the operation is the one that the command itself begins
-  bool may_outlive_platform = false;  // the command doesn't ask how one of its platform calls ended
+  bool may_outlive_platform = false;  // the command doesn't ask how one of its platform calls ended, or tries again
+  bool may_outlive_memory = false;    // it tries again
+  bool keeps_size = false;            // on failure, of the response
 };
 
 /// How a scenario shows in a test's output.
@@ -71,6 +79,7 @@ std::vector<scenario> begin_scenarios();
 std::vector<scenario> step_scenarios();
 std::vector<scenario> finish_scenarios();
 std::vector<scenario> algorithm_scenarios();
+std::vector<scenario> soter_scenarios();
 
 }  // namespace testing_support
 

@@ -28,14 +28,16 @@ USED = {
     "TEE_AEEncryptFinal", "TEE_AEDecryptFinal", "TEE_MACInit", "TEE_MACComputeFinal", "TEE_DigestUpdate",
     "TEE_DigestDoFinal", "TEE_AsymmetricEncrypt", "TEE_AsymmetricDecrypt", "TEE_AsymmetricSignDigest",
     "TEE_AsymmetricVerifyDigest", "TEE_AsymmetricExport",
+    # soter: properties, the counter, the provisioning TA
+    "TEE_GetPropertyAsString", "TEE_GetPropertyAsIdentity", "TEE_WriteObjectData", "TEE_SeekObjectData",
+    "TEE_OpenTASession", "TEE_InvokeTACommand", "TEE_CloseTASession",
     # the boot's secret, trace
     "GetBootSeed", "tee_trace",
 }
 # Calls that the TA may come to need, and any platform that runs it offers.
 PERMITTED = {
-    "TEE_MemMove", "TEE_MemFill", "TEE_GetPropertyAsString", "TEE_GetPropertyAsIdentity", "TEE_WriteObjectData",
-    "TEE_SeekObjectData", "TEE_CipherInit", "TEE_CipherUpdate", "TEE_CipherDoFinal", "TEE_AEUpdateAAD", "TEE_MACUpdate",
-    "TEE_OpenTASession", "TEE_InvokeTACommand", "TEE_CloseTASession",
+    "TEE_MemMove", "TEE_MemFill", "TEE_CipherInit", "TEE_CipherUpdate", "TEE_CipherDoFinal", "TEE_AEUpdateAAD",
+    "TEE_MACUpdate",
 }
 ENTRY_LAYER = ["tee_entry_open_session", "tee_entry_close_session", "tee_entry_invoke_command"]
 # What a compiler calls on its own: the five that every freestanding environment has, and its arithmetic helpers.

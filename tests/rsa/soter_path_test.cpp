@@ -2,6 +2,8 @@
 // The framework is the test's own here.
 #include <fmt/format.h>
 
+#include <optional>
+
 #include "algorithms/rsa/rsa_sign.h"
 #include "soter/soter_enhance.h"
 #include "soter/soter_init.h"
@@ -25,8 +27,11 @@ struct played_soter {
   int asked = 0;
   bytes message;
   param_list in_params;
-  TEE_ObjectHandle key = TEE_HANDLE_NULL;
-  TEE_OperationHandle digest_operation = TEE_HANDLE_NULL;
+  TEE_OperationHandle operation = TEE_HANDLE_NULL, digest_operation = TEE_HANDLE_NULL;
+  const keymaster_key_param_set_t* authorization_set = nullptr;
+  std::size_t room = 0;
+  std::optional<std::uint32_t> salt;  // of PSS
+  int byte_behind = -1;
 };
 played_soter soter;
 
@@ -41,23 +46,26 @@ TEE_Result soter_ensure_ready() {
 bool soter_ready() {
   return soter.ready == TEE_SUCCESS;
 }
-void soter_release() {}
+TEE_Result soter_init_resources() {
+  return soter.ready;
+}
+void soter_release_resources() {}
+void soter_start() {}
 
-TEE_Result soter_enhance_sign_finish(TEE_ObjectHandle key, TEE_OperationHandle digest_operation,
-                                     const keymaster_key_param_set_t& in_params, std::span<const uint8_t> message,
-                                     secret_bytes& output) {
+TEE_Result soter_enhance_sign_finish(const soter_signer& op, const keymaster_key_param_set_t& in_params,
+                                     std::span<const uint8_t> message, secret_bytes& output) {
   ++soter.asked;
-  soter.key = key;
-  soter.digest_operation = digest_operation;
+  soter.operation = op.operation;
+  soter.digest_operation = op.digest_operation;
+  soter.authorization_set = &op.authorization_set;
+  soter.room = op.buffer.size();
+  soter.salt.reset();
+  if (op.salt != nullptr) soter.salt = op.salt->content.value.a;
+  soter.byte_behind = message.data()[message.size()];
   soter.in_params = from_ta(in_params);
   soter.message.assign(message.begin(), message.end());
   if (!output.copy_of(soter.statement)) return TEE_ERROR_OUT_OF_MEMORY;
   return soter.signs;
-}
-TEE_Result soter_enhance_export_key(std::span<const uint8_t>, const keymaster_key_param_set_t&, uint8_t*,
-                                    uint32_t* output_length) {
-  *output_length = 0;
-  return TEE_ERROR_NOT_IMPLEMENTED;
 }
 
 }  // namespace keymaster
@@ -123,7 +131,7 @@ class SoterPathTest : public TaUnitTest {
     return done;
   }
 
-  const param_list scheme = signature(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PKCS1_1_5_SIGN);
+  param_list scheme = signature(KM_DIGEST_SHA_2_256, KM_PAD_RSA_PKCS1_1_5_SIGN);
   rsa_sign_operation_t* op = nullptr;
 };
 
@@ -134,7 +142,7 @@ TEST_F(SoterPathTest, AKeyWithTheTagGetsABufferOf4096BytesBesideAllTheRest) {
   EXPECT_EQ(made.result, TEE_SUCCESS);
   EXPECT_EQ(made.error, KM_ERROR_OK);
   EXPECT_EQ(op->soter_capacity, 4096U);
-  EXPECT_EQ(op->soter_buffer.size(), 4096U);
+  EXPECT_EQ(op->soter_buffer.size(), 4097U);  // a zero byte behind the message
   EXPECT_EQ(op->soter_length, 0U);
   EXPECT_TRUE(op->key);
   EXPECT_TRUE(op->operation);
@@ -189,13 +197,13 @@ TEST_F(SoterPathTest, TheMessageGrowsWithoutLimitByDoublingOrToWhatItNeeds) {
   ta.clear_trace();
   EXPECT_EQ(update(all.subspan(4096, 1)), KM_ERROR_OK);
   EXPECT_EQ(op->soter_capacity, 8192U);
-  EXPECT_EQ(op->soter_buffer.size(), 8192U);
+  EXPECT_EQ(op->soter_buffer.size(), 8193U);
   EXPECT_THAT(ta.traced(trace_level::debug), ElementsAre(updating, "expand soter buf 4096 -> 8192"));
 
   ta.clear_trace();
   EXPECT_EQ(update(all.subspan(4097)), KM_ERROR_OK);
   EXPECT_EQ(op->soter_capacity, message.size());
-  EXPECT_EQ(op->soter_buffer.size(), message.size());
+  EXPECT_EQ(op->soter_buffer.size(), message.size() + 1);
   EXPECT_THAT(ta.traced(trace_level::debug), ElementsAre(updating, "expand soter buf 8192 -> 104097"));
 
   EXPECT_EQ(update({}), KM_ERROR_OK);
@@ -203,6 +211,7 @@ TEST_F(SoterPathTest, TheMessageGrowsWithoutLimitByDoublingOrToWhatItNeeds) {
   EXPECT_THAT(ta.errors(), IsEmpty());
   EXPECT_EQ(finish().error, KM_ERROR_OK);
   EXPECT_EQ(soter.message, message);
+  EXPECT_EQ(soter.byte_behind, 0) << "a full buffer can be read as text";
 }
 
 TEST_F(SoterPathTest, WhatTheMessageGrewOutOfIsWiped) {
@@ -265,8 +274,29 @@ TEST_F(SoterPathTest, TheStatementIsTheOutput) {
   EXPECT_EQ(soter.asked, 1);
   EXPECT_EQ(soter.message, from_text("message"));
   EXPECT_EQ(soter.in_params.marshal(), params.marshal());
-  EXPECT_EQ(soter.key, op->key.get());
+  EXPECT_EQ(soter.operation, op->operation.get());
   EXPECT_EQ(soter.digest_operation, op->digest_operation.get());
+  EXPECT_EQ(soter.authorization_set, &op->authorization_set);
+  EXPECT_EQ(soter.room, 64U);
+  EXPECT_EQ(soter.salt, std::nullopt);
+}
+
+TEST_F(SoterPathTest, TheSaltOfPssIsAsLongAsTheDigestWhereBothFit) {
+  // 64 bytes: SHA-224 leaves room for a salt of its length (2 * 29), SHA-256 does not (2 * 33).
+  for (const auto& [digest, salt] : {std::pair{KM_DIGEST_SHA_2_224, -1}, std::pair{KM_DIGEST_SHA_2_256, -2}}) {
+    scheme = signature(digest, KM_PAD_RSA_PSS);
+    start();
+    EXPECT_EQ(finish().error, KM_ERROR_OK);
+    EXPECT_EQ(soter.salt, static_cast<std::uint32_t>(salt));
+    drop();
+  }
+}
+
+TEST_F(SoterPathTest, AKeyThatSignsWithoutADigestHasNoDigestOperation) {
+  scheme = signature(KM_DIGEST_NONE, KM_PAD_RSA_PKCS1_1_5_SIGN);
+  start();
+  EXPECT_EQ(finish().error, KM_ERROR_OK);
+  EXPECT_EQ(soter.digest_operation, TEE_OperationHandle{TEE_HANDLE_NULL});
 }
 
 TEST_F(SoterPathTest, AnEmptyMessageIsOneToo) {

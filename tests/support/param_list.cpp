@@ -28,6 +28,11 @@ param_list& param_list::add_blob(std::uint32_t tag, bytes blob) {
   return *this;
 }
 
+param_list& param_list::add(const param_list& others) {
+  params_.insert(params_.end(), others.params_.begin(), others.params_.end());
+  return *this;
+}
+
 param_list& param_list::remove(std::uint32_t tag) {
   std::erase_if(params_, [tag](const param& p) { return p.tag == tag; });
   return *this;

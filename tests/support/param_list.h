@@ -21,6 +21,7 @@ class param_list {
  public:
   param_list& add(std::uint32_t tag, std::uint64_t value = 1);
   param_list& add_blob(std::uint32_t tag, bytes blob);
+  param_list& add(const param_list& others);
   param_list& remove(std::uint32_t tag);
 
   /// marshal gives the byte form, without gaps: count, then 24-byte records with their blobs.

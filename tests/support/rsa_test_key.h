@@ -26,7 +26,7 @@ class rsa_test_key {
   static constexpr int salt_as_digest = -1;
   static constexpr int salt_any = -2;  // when verifying
 
-  /// of_bits answers the key of a size: 512, 680, 688, 1024 or 2048.
+  /// of_bits answers the key of a size: 512, 680, 688, 1024, 2048, 3072 or 6144.
   static const rsa_test_key& of_bits(unsigned bits);
 
   [[nodiscard]] const rsa_components& components() const { return components_; }

@@ -14,6 +14,8 @@ namespace keymaster {
 namespace {
 
 constexpr uint32_t soter_start_capacity = 4096;
+/// Beyond its capacity the buffer has a zero byte, so that even a full one can be read as text.
+constexpr uint32_t soter_nul = 1;
 
 /// Salt lengths as the platform reads them: as long as the digest, or as long as the key allows.
 constexpr uint32_t pss_salt_as_digest = static_cast<uint32_t>(-1);
@@ -30,7 +32,7 @@ keymaster_error_t prepare_soter(rsa_sign_operation_t& op, const keymaster_key_pa
     TRACE_ERROR("soter resources is not ready, error 0x%x\n", r);
     return KM_ERROR_UNKNOWN_ERROR;
   }
-  if (!op.soter_buffer.allocate(soter_start_capacity)) {
+  if (!op.soter_buffer.allocate(soter_start_capacity + soter_nul)) {
     TRACE_ERROR("No memory for soter");
     return KM_ERROR_MEMORY_ALLOCATION_FAILED;
   }
@@ -43,7 +45,7 @@ keymaster_error_t expand_soter_buffer(rsa_sign_operation_t& op, uint64_t needed)
   const uint64_t wanted = std::max(needed, uint64_t{op.soter_capacity} * 2);
   const uint32_t size = static_cast<uint32_t>(std::min<uint64_t>(wanted, UINT32_MAX));
   secret_bytes larger;
-  if (wanted > UINT32_MAX || !larger.allocate(size)) {
+  if (wanted + soter_nul > UINT32_MAX || !larger.allocate(size + soter_nul)) {
     TRACE_ERROR("no memory to expand soter buf %u", size);
     return KM_ERROR_MEMORY_ALLOCATION_FAILED;
   }
@@ -65,6 +67,15 @@ keymaster_error_t gather_soter(rsa_sign_operation_t& op, std::span<const uint8_t
   return KM_ERROR_OK;
 }
 
+/// The salt is as long as the digest where the key leaves room for both, and otherwise as long as it can be.
+TEE_Attribute pss_salt(const rsa_sign_operation_t& op) {
+  const uint64_t both = 2 * (uint64_t{digest_size(op.digest)} + 1);
+  TEE_Attribute salt;
+  TEE_InitValueAttribute(&salt, TEE_ATTR_RSA_PSS_SALT_LENGTH,
+                         both <= op.modulus_size() ? pss_salt_as_digest : pss_salt_longest, 0);
+  return salt;
+}
+
 TEE_Result sign_digest(rsa_sign_operation_t& op, secret_bytes& signature, uint32_t* length, keymaster_error_t* error) {
   uint32_t digest_length = 0;
   if (TEE_Result r = finish_digest(op, &digest_length); r != TEE_SUCCESS) return r;
@@ -73,11 +84,7 @@ TEE_Result sign_digest(rsa_sign_operation_t& op, secret_bytes& signature, uint32
     *error = KM_ERROR_MEMORY_ALLOCATION_FAILED;
     return TEE_SUCCESS;
   }
-  // The salt is as long as the digest where the key leaves room for both, and otherwise as long as it can be.
-  const uint64_t both = 2 * (uint64_t{digest_size(op.digest)} + 1);
-  TEE_Attribute salt;
-  TEE_InitValueAttribute(&salt, TEE_ATTR_RSA_PSS_SALT_LENGTH,
-                         both <= op.modulus_size() ? pss_salt_as_digest : pss_salt_longest, 0);
+  const TEE_Attribute salt = pss_salt(op);
   const bool pss = op.padding == KM_PAD_RSA_PSS;
   *length = signature.size();
   const TEE_Result result = TEE_AsymmetricSignDigest(op.operation.get(), pss ? &salt : nullptr, pss ? 1 : 0,
@@ -112,8 +119,11 @@ TEE_Result sign_raw(rsa_sign_operation_t& op, secret_bytes& signature, uint32_t*
 TEE_Result sign_statement(rsa_sign_operation_t& op, const keymaster_key_param_set_t& in_params, secret_bytes& output,
                           keymaster_error_t* error) {
   TRACE_DEBUG("sign finish is from soter");
-  const TEE_Result result = soter_enhance_sign_finish(op.key.get(), op.digest_operation.get(), in_params,
-                                                      {op.soter_buffer.data(), op.soter_length}, output);
+  const TEE_Attribute salt = pss_salt(op);
+  const soter_signer signer = {op.authorization_set, op.operation.get(), op.digest_operation.get(), op.buffer.span(),
+                               op.padding == KM_PAD_RSA_PSS ? &salt : nullptr};
+  const TEE_Result result =
+      soter_enhance_sign_finish(signer, in_params, {op.soter_buffer.data(), op.soter_length}, output);
   if (result != TEE_SUCCESS) {
     TRACE_ERROR("soter enhance error %x", result);
     output.reset();

@@ -8,7 +8,7 @@
 namespace keymaster {
 
 struct rsa_sign_operation_t : rsa_operation_t {
-  secret_bytes soter_buffer;  // the whole message of a soter key; empty for other keys
+  secret_bytes soter_buffer;  // the whole message of a soter key and a zero byte; empty for other keys
   uint32_t soter_capacity = 0;
   uint32_t soter_length = 0;
 };

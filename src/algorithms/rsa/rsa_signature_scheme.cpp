@@ -138,7 +138,8 @@ bool build_pkcs1_block(rsa_operation_t& op) {
 
 TEE_Result finish_digest(rsa_operation_t& op, uint32_t* length) {
   *length = op.buffer.size();
-  const TEE_Result result = TEE_DigestDoFinal(op.digest_operation.get(), nullptr, 0, op.buffer.data(), length);
+  TEE_Result result = TEE_DigestDoFinal(op.digest_operation.get(), nullptr, 0, op.buffer.data(), length);
+  if (result == TEE_SUCCESS && *length > op.buffer.size()) result = TEE_ERROR_GENERIC;  // it can't have fitted
   if (result != TEE_SUCCESS) TRACE_ERROR("DigestDoFinal failed with 0x%08x\n", result);
   return result;
 }

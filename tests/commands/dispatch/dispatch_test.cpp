@@ -9,6 +9,7 @@ namespace {
 
 using hosted_tee::trace_level;
 
+constexpr std::uint32_t soter_generate = 0xFF00;
 constexpr std::uint32_t soter_set_fid = 0xFF04;
 constexpr std::uint32_t slot_size = 16;
 
@@ -59,6 +60,9 @@ std::vector<std::uint32_t> wrong_types(std::uint32_t right) {
 
 class DispatchTest : public CommandTest {
  protected:
+  /// With no other TA on the device only the Keymaster TA's own lines are traced.
+  DispatchTest() { tee.world().device().ta_folders.clear(); }
+
   raw_session session{tee.world()};
 
   /// Every call's first line.
@@ -86,7 +90,11 @@ TEST_F(DispatchTest, EveryCommandIsTracedByItsNumberItsTypesAndItsName) {
     filled_slots slots(row.types, 0, 0);
     tee.clear_trace();
     (void)session.invoke(row.id, row.types, slots.params);
-    EXPECT_THAT(lines(trace_level::info), testing::ElementsAre(call_line(row.id, row.types), row.name));
+    std::vector<std::string> expected = {call_line(row.id, row.types), row.name};
+    if (row.id == soter_generate) {  // the one handler with a line of its own at this level
+      expected.emplace_back("this function should not be called in anytime but in meta mode\n");
+    }
+    EXPECT_EQ(lines(trace_level::info), expected);
     const auto& first = tee.world().trace().lines().front();
     EXPECT_EQ(first.text, call_line(row.id, row.types));
     EXPECT_EQ(first.prefix, "KEYMASTER");
