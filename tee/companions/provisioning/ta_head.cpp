@@ -1,0 +1,8 @@
+// The header record: what a loader reads before anything else.
+#include "quil/quil_protocol.h"
+#include "tee/companions/common/companion_limits.h"
+
+extern "C" __attribute__((used)) const tee_ta_head ta_head = {
+    QUIL_TA_UUID,           keymaster::companion::stack_size, keymaster::companion::flags,
+    tee_entry_open_session, tee_entry_close_session,          tee_entry_invoke_command,
+};
