@@ -16,12 +16,6 @@
 namespace kmctl {
 namespace {
 
-struct command_row {
-  const char* name;
-  const char* description;
-  void (*define)(CLI::App& command, context& ctx);
-};
-
 constexpr std::array command_rows = std::to_array<command_row>({
     {"info", "Show the TEE, the TA and what it offers", define_info},
     {"generate", "Make a key and seal it into a blob", define_generate},
@@ -34,6 +28,11 @@ constexpr std::array command_rows = std::to_array<command_row>({
     {"decrypt", "Decrypt a file", define_decrypt},
     {"delete", "Delete a key", define_delete},
     {"delete-all", "Ask the TA to delete every key", define_delete_all},
+    {"device", "Give the device its identity, once, in the factory", define_device},
+    {"attest", "Show what the device attests its keys with", define_attest},
+    {"finger", "Enrol fingers, and touch the sensor", define_finger},
+    {"auth", "Enrol passwords, and turn them into auth tokens", define_auth},
+    {"statement", "Check what devices state of their keys", define_statement},
     {"demo", "Show on a file of yours what the system does", define_demo},
 });
 
@@ -74,6 +73,16 @@ bool asks_for_json(int argc, const char* const* argv) {
   return std::any_of(argv, argv + argc, [](const char* word) { return std::string_view(word) == "--json"; });
 }
 
+/// As far as the command line names a sub-command: "kmctl", "kmctl device", "kmctl device status".
+std::string chosen_command(const CLI::App& app) {
+  std::string name = app.get_name();
+  for (const CLI::App* at = &app; !at->get_subcommands().empty();) {
+    at = at->get_subcommands().front();
+    name += " " + at->get_name();
+  }
+  return name;
+}
+
 int parse_and_run(CLI::App& app, int argc, const char* const* argv, const context& ctx) {
   if (argc < 2) {
     complain(app.help());
@@ -92,25 +101,27 @@ int parse_and_run(CLI::App& app, int argc, const char* const* argv, const contex
     if (const auto rest = app.remaining(); app.get_subcommands().empty() && !rest.empty()) {
       throw usage_error(fmt::format("there is no sub-command '{}'", rest.front()), "see kmctl --help");
     }
-    const auto chosen = app.get_subcommands();
-    const std::string command = chosen.empty() ? "kmctl" : "kmctl " + chosen.front()->get_name();
-    throw usage_error(stop.what(), "see " + command + " --help");
+    throw usage_error(stop.what(), "see " + chosen_command(app) + " --help");
   }
 }
 
 }  // namespace
 
-std::unique_ptr<CLI::App> make_application(context& ctx) {
-  auto app = std::make_unique<CLI::App>(description, "kmctl");
-  app->footer(std::string(environment_help) + "\n" + exit_code_help);
-  app->require_subcommand(1);
-  app->option_defaults()->always_capture_default(false);
-  add_global_options(*app, ctx);
-  for (const command_row& row : command_rows) {
-    CLI::App* const command = app->add_subcommand(row.name, row.description);
+void define_group(CLI::App& group, context& ctx, std::span<const command_row> commands) {
+  group.require_subcommand(1);
+  for (const command_row& row : commands) {
+    CLI::App* const command = group.add_subcommand(row.name, row.description);
     command->fallthrough();  // so that --json and its like may also stand behind the sub-command
     row.define(*command, ctx);
   }
+}
+
+std::unique_ptr<CLI::App> make_application(context& ctx) {
+  auto app = std::make_unique<CLI::App>(description, "kmctl");
+  app->footer(std::string(environment_help) + "\n" + exit_code_help);
+  app->option_defaults()->always_capture_default(false);
+  add_global_options(*app, ctx);
+  define_group(*app, ctx, command_rows);
   return app;
 }
 

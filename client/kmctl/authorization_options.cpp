@@ -7,6 +7,7 @@
 #include <string_view>
 #include <vector>
 
+#include "client/kmctl/attested_key.h"
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/files.h"
 #include "client/kmctl/operation_parameters.h"
@@ -21,6 +22,7 @@ using client::authorizations;
 
 enum class value_kind { name, names, number, numbers, date, flag, file };
 
+constexpr unsigned for_new_keys = static_cast<unsigned>(option_use::generate);
 constexpr unsigned for_keys = static_cast<unsigned>(option_use::generate) | static_cast<unsigned>(option_use::import);
 constexpr unsigned for_ciphers = static_cast<unsigned>(option_use::cipher);
 constexpr unsigned for_operations = static_cast<unsigned>(option_use::operation) | for_ciphers;
@@ -29,6 +31,8 @@ constexpr const char* group_kind = "Kind of key";
 constexpr const char* group_use = "What it may be used for";
 constexpr const char* group_when = "When and how often (a boot lasts as long as the secure world runs)";
 constexpr const char* group_who = "Who may use it";
+constexpr const char* group_attested =
+    "Attested keys (generated ones only: the TA can't vouch for what was known outside)";
 constexpr const char* group_operation = "Operation";
 
 struct option_row {
@@ -67,6 +71,15 @@ constexpr std::array option_rows = std::to_array<option_row>({
     {"--user-auth-type", KM_TAG_USER_AUTH_TYPE, value_kind::name, for_keys, group_who, "how the user authenticates"},
     {"--auth-timeout", KM_TAG_AUTH_TIMEOUT, value_kind::number, for_keys, group_who,
      "seconds that an authentication lasts (default: one operation)"},
+    {"--soter", KM_TAG_SOTER_KEY, value_kind::flag, for_new_keys, group_attested,
+     "the key signs statements, and its own statement is signed"},
+    {"--signed-by-attk", KM_TAG_SOTER_SIGNED_BY_ATTK, value_kind::flag, for_new_keys, group_attested,
+     "by the device's attestation key (the default)"},
+    {"--signed-by", KM_TAG_SOTER_SIGNING_KEY_BLOB, value_kind::file, for_new_keys, group_attested,
+     "by the RSA-2048 key of this blob"},
+    {"--counted", KM_TAG_SOTER_COUNTED, value_kind::flag, for_new_keys, group_attested,
+     "the key's statement tells the device's counter"},
+    {"--uid", KM_TAG_SOTER_UID, value_kind::number, for_new_keys, group_attested, "the user that the key is made for"},
     {"--block-mode", KM_TAG_BLOCK_MODE, value_kind::name, for_ciphers, group_operation, "block mode"},
     {"--padding", KM_TAG_PADDING, value_kind::name, for_operations, group_operation, "padding"},
     {"--digest", KM_TAG_DIGEST, value_kind::name, for_operations, group_operation, "digest"},
@@ -275,7 +288,8 @@ void application_options::add_to(CLI::App& command) {
   add("--app-data", given_.data, "application data the key is bound to, in the same forms");
 }
 
-authorizations with_defaults(const authorizations& given, option_use use) {
+authorizations with_defaults(const authorizations& stated, option_use use) {
+  const authorizations given = attested_description(stated);
   authorizations all;
   const std::uint64_t algorithm = given.unique_number(KM_TAG_ALGORITHM).value_or(KM_ALGORITHM_RSA);
   if (!given.contains(KM_TAG_ALGORITHM)) {

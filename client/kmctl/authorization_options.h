@@ -43,11 +43,11 @@ class application_options {
   std::vector<std::string> files_;
 };
 
-/// with_defaults completes the description of a new key: what `given` leaves out is filled with what suits its
+/// with_defaults completes the description of a new key: what `stated` leaves out is filled with what suits its
 /// algorithm (RSA when it names none) and the use that is known, so that an empty description is a sound key. A key
 /// that is imported brings its own size and exponent, which stay out. Without a user's id the key needs no
-/// authentication.
-[[nodiscard]] keymaster::client::authorizations with_defaults(const keymaster::client::authorizations& given,
+/// authentication. Throws usage_error for an attested key that would be worthless, see attested_key.h.
+[[nodiscard]] keymaster::client::authorizations with_defaults(const keymaster::client::authorizations& stated,
                                                               option_use use);
 
 }  // namespace kmctl

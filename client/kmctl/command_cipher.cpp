@@ -13,6 +13,7 @@
 #include "client/kmctl/files.h"
 #include "client/kmctl/operation_parameters.h"
 #include "client/kmctl/output_file.h"
+#include "client/kmctl/user_presence.h"
 #include "client/kmctl/values.h"
 
 namespace kmctl {
@@ -56,6 +57,7 @@ struct cipher_options {
   std::string out = "-";
   application_options app;
   authorization_options parameters;
+  presence_options presence;
   std::optional<bytes> nonce;
   std::optional<bytes> associated_data;
   bool raw = false;
@@ -75,6 +77,7 @@ struct cipher_options {
               "associated data that gcm authenticates with the text: text, hex:00ff17 or @FILE");
     add_bytes(command, "--nonce", nonce, parse_nonce, nonce_help);
     command.add_flag("--raw", raw, raw_help)->group(group);
+    presence.add_to(command);
     app.add_to(command);
   }
 
@@ -91,8 +94,8 @@ struct cipher_options {
 
   [[nodiscard]] std::vector<std::string> inputs() const {
     std::vector<std::string> all{blob, file};
-    for (const auto* const more : {&app.files(), &parameters.files(), &value_files}) {
-      all.insert(all.end(), more->begin(), more->end());
+    for (const auto& more : {app.files(), parameters.files(), presence.files(), value_files}) {
+      all.insert(all.end(), more.begin(), more.end());
     }
     return all;
   }
@@ -124,7 +127,7 @@ struct decrypt_options : cipher_options {
 };
 
 void check_files(const cipher_options& options) {
-  refuse_shared_input({&options.blob, &options.file});
+  refuse_shared_inputs(options.inputs());
   refuse_overwriting(options.out, options.inputs());
 }
 
@@ -158,8 +161,8 @@ void check_options_fit(const cipher_options& options, const key_use& key) {
 }
 
 key_use use_of(const cipher_options& options, client::session& ta, keymaster::keymaster_purpose_t purpose,
-               byte_view blob) {
-  key_use key = make_key_use(ta, purpose, blob, options.app.given(), options.parameters.given());
+               byte_view blob, user_presence& user) {
+  key_use key = make_key_use(ta, purpose, blob, options.app.given(), options.parameters.given(), &user);
   check_options_fit(options, key);
   if (options.nonce) {
     key.parameters.nonce(*options.nonce);
@@ -221,7 +224,8 @@ int run_encrypt(const encrypt_options& options, const context& ctx) {
   const bytes blob = read_small_file(options.blob, "key blob");
   input_file text(options.file);
   tee_link tee(ctx);
-  const key_use key = use_of(options, tee.ta(), keymaster::KM_PURPOSE_ENCRYPT, blob);
+  user_presence user(tee.connection(), options.presence);
+  const key_use key = use_of(options, tee.ta(), keymaster::KM_PURPOSE_ENCRYPT, blob, user);
   check_nonce_is_kept(options, key);
 
   output_file out(options.out);
@@ -271,7 +275,8 @@ int run_decrypt(const decrypt_options& options, const context& ctx) {
   const bytes blob = read_small_file(options.blob, "key blob");
   input_file file(options.file);
   tee_link tee(ctx);
-  key_use key = use_of(options, tee.ta(), keymaster::KM_PURPOSE_DECRYPT, blob);
+  user_presence user(tee.connection(), options.presence);
+  key_use key = use_of(options, tee.ta(), keymaster::KM_PURPOSE_DECRYPT, blob, user);
   const data_stream data = ciphertext_of(options, file, key);
 
   const bool is_gcm = key.parameters.unique_number(keymaster::KM_TAG_BLOCK_MODE) == keymaster::KM_MODE_GCM;

@@ -21,6 +21,11 @@ constexpr const char* examples =
     "file\n"
     "and a changed blob are refused; an EC signature and a MAC that openssl checks; the file encrypted with AES-GCM,\n"
     "decrypted, and refused when a bit has changed; a secret that openssl encrypts with RSA-OAEP and the TA decrypts.\n"
+    "Last, attestation: the device gets an attestation key unless it has one, vouches for a key, that one for "
+    "another,\n"
+    "and that one for a challenge which a finger agreed to; a relying party checks the chain. The key, properties "
+    "that\n"
+    "were missing and one finger stay on the device: name another one with --state to keep yours as it is.\n"
     "Ends with an exit code other than 0 when any of this does not come out.\n\n"
     "Examples:\n"
     "  kmctl demo\n"
@@ -63,8 +68,8 @@ fs::path folder_of(const demo_options& options) {
   return name;
 }
 
-constexpr std::array rounds{show_rsa_signature, show_ec_signature, show_mac, show_file_encryption,
-                            show_secret_transport};
+constexpr std::array rounds{show_rsa_signature,   show_ec_signature,     show_mac,
+                            show_file_encryption, show_secret_transport, show_attestation};
 
 int run_demo(const demo_options& options, const context& ctx) {
   const std::string file = file_of(options).string();

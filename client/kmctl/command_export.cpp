@@ -15,6 +15,7 @@
 #include "client/kmctl/system_failure.h"
 #include "client/kmctl/values.h"
 #include "client/lib/key_material.h"
+#include "client/lib/statement.h"
 
 namespace kmctl {
 namespace {
@@ -23,10 +24,14 @@ namespace client = keymaster::client;
 using client::authorizations;
 
 constexpr const char* export_examples =
+    "The TA exports an attested key as a signed statement only. Without --statement the public key is taken out of "
+    "it,\n"
+    "and a counter of the device may have moved.\n\n"
     "Examples:\n"
     "  kmctl export key.blob                     the public key as PEM\n"
     "  kmctl export key.blob --der -o public.der\n"
-    "  kmctl export key.blob | openssl pkey -pubin -text -noout\n";
+    "  kmctl export key.blob | openssl pkey -pubin -text -noout\n"
+    "  kmctl export --statement app.blob -o app.statement     for kmctl statement verify\n";
 
 constexpr const char* characteristics_examples =
     "Examples:\n"
@@ -62,36 +67,64 @@ struct export_options {
   sealed_key key;
   std::string out = "-";
   bool der = false;
+  bool statement = false;
   CLI::Option* data_option = nullptr;
 
   void add_to(CLI::App& command) {
     key.add_to(command);
     data_option = command.add_option("-o,--output", out, "file for the public key (default: standard output)");
     data_option->type_name("FILE");
-    command.add_flag("--der", der, "DER in place of PEM");
+    auto* const der_flag = command.add_flag("--der", der, "DER in place of PEM");
+    command.add_flag("--statement", statement, "the signed statement of an attested key")->excludes(der_flag);
     command.footer(export_examples);
   }
+  [[nodiscard]] bool binary() const { return der || statement; }
+  [[nodiscard]] const char* format() const {
+    if (statement) {
+      return "statement";
+    }
+    return der ? "der" : "pem";
+  }
 };
+
+bytes bytes_of(const std::string& text) {
+  return {text.begin(), text.end()};
+}
+
+/// What the TA exported, in the form that was asked for.
+bytes exported_form(const export_options& options, const authorizations& characteristics, const bytes& exported) {
+  if (options.statement) {
+    return exported;
+  }
+  if (characteristics.contains(keymaster::KM_TAG_SOTER_KEY)) {
+    const client::rsa_public_key key = client::told_key(exported);
+    return options.der ? key.der() : bytes_of(key.pem());
+  }
+  const auto algorithm = static_cast<keymaster::keymaster_algorithm_t>(
+      characteristics.unique_number(keymaster::KM_TAG_ALGORITHM).value_or(0));
+  return options.der ? client::public_key_der(algorithm, exported)
+                     : bytes_of(client::public_key_pem(algorithm, exported));
+}
 
 int run_export(const export_options& options, const context& ctx) {
   std::vector<std::string> inputs = options.key.app.files();
   inputs.push_back(options.key.path);
   refuse_overwriting(options.out, inputs);
-  (options.der ? check_binary_output : check_output)(options.out, {});
+  (options.binary() ? check_binary_output : check_output)(options.out, {});
   const bytes blob = options.key.read();
   tee_link tee(ctx);
   const authorizations characteristics = client::get_characteristics(tee.ta(), blob, options.key.app.given());
-  const auto algorithm = static_cast<keymaster::keymaster_algorithm_t>(
-      characteristics.unique_number(keymaster::KM_TAG_ALGORITHM).value_or(0));
-  const bytes exported = client::export_key(tee.ta(), blob, options.key.app.given());
-  if (options.der) {
-    write_binary(options.out, client::public_key_der(algorithm, exported), {});
-  } else {
-    write_file(options.out, client::as_bytes(client::public_key_pem(algorithm, exported)), {});
+  if (options.statement && !characteristics.contains(keymaster::KM_TAG_SOTER_KEY)) {
+    throw usage_error("only attested keys have a statement, and this is none", "leave --statement out");
   }
+  const bytes content =
+      exported_form(options, characteristics, client::export_key(tee.ta(), blob, options.key.app.given()));
+  (options.binary() ? write_binary : write_file)(options.out, content, {});
   if (options.out != "-" || ctx.json_output) {
-    tell(ctx, fmt::format("Public part of the {} key in {}", key_title(characteristics), options.out),
-         {{"output", options.out}, {"format", options.der ? "der" : "pem"}, {"key", key_title(characteristics)}});
+    tell(ctx,
+         fmt::format("{} of the {} key in {}", options.statement ? "Statement" : "Public part",
+                     key_title(characteristics), options.out),
+         {{"output", options.out}, {"format", options.format()}, {"key", key_title(characteristics)}});
   }
   return exit_done;
 }

@@ -11,6 +11,7 @@
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/files.h"
 #include "client/kmctl/output_file.h"
+#include "client/kmctl/password.h"
 #include "client/kmctl/progress.h"
 #include "client/kmctl/values.h"
 #include "client/lib/key_material.h"
@@ -37,6 +38,9 @@ constexpr const char* generate_examples =
     "  kmctl generate --algorithm hmac --min-mac-length 128 hmac.blob\n"
     "  kmctl generate --app-id my.app --app-data hex:00ff17 key.blob\n"
     "  kmctl generate --active 2030-01-01 --origination-expire 2031-01-01 key.blob\n"
+    "  kmctl generate --soter --counted --uid 1000 app.blob\n"
+    "  kmctl generate --soter --signed-by app.blob --counted --uid 1000 --user-secure-id 1234567890 \\\n"
+    "        --user-auth-type fingerprint auth.blob\n"
     "  kmctl generate - > key.blob\n";
 
 constexpr const char* import_examples =
@@ -120,7 +124,7 @@ void tell_key(const context& ctx, const char* done, const std::string& path, con
 }
 
 int run_generate(const generate_options& options, const context& ctx) {
-  options.out.check({}, options.app);
+  options.out.check(options.description.files(), options.app);
   authorizations description = with_defaults(options.description.given(), option_use::generate);
   const std::string title = key_title(description);
   description.add(options.app.given().tags());
@@ -143,7 +147,7 @@ bool is_raw(std::uint64_t algorithm) {
   return algorithm == keymaster::KM_ALGORITHM_AES || algorithm == keymaster::KM_ALGORITHM_HMAC;
 }
 
-/// The passphrase of an encrypted key. A file's last line end does not belong to it.
+/// The passphrase of an encrypted key.
 std::optional<secret_bytes> passphrase_of(const import_options& options) {
   if (!options.passphrase) {
     return std::nullopt;
@@ -153,11 +157,7 @@ std::optional<secret_bytes> passphrase_of(const import_options& options) {
     const bytes typed = parse_bytes(*options.passphrase);  // it lies open in the command line anyway
     return secret_bytes(typed.begin(), typed.end());
   }
-  secret_bytes text = read_secret_file(*file, "passphrase");
-  while (!text.empty() && (text.back() == '\n' || text.back() == '\r')) {
-    text.pop_back();
-  }
-  return text;
+  return read_password_file(*file);
 }
 
 std::vector<std::string> files_of(const import_options& options) {

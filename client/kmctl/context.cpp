@@ -52,6 +52,28 @@ std::string hint_of(const std::exception& failed) {
   return {};
 }
 
+template <class Number>
+json named(const std::string& name, Number value) {
+  return {{"name", name}, {"value", value}};
+}
+
+/// What goes with the result depends on who answered.
+void add_refusal(json& object, const keymaster::client::failure& facts) {
+  switch (facts.kind) {
+    case error_kind::soter:
+      object["soter_status"] = named(keymaster::client::soter_status_name(facts.soter_status), facts.soter_status);
+      break;
+    case error_kind::companion:
+      if (facts.wait_ms != 0) {
+        object["wait_ms"] = facts.wait_ms;
+      }
+      break;
+    default:
+      object["keymaster_error"] =
+          named(keymaster::client::keymaster_error_name(facts.keymaster_error), facts.keymaster_error);
+  }
+}
+
 bool data_takes_stdout(const context& ctx) {
   return ctx.data_on_stdout && ctx.data_on_stdout();
 }
@@ -94,7 +116,10 @@ int exit_code_of(const std::exception& failed) {
     case error_kind::connection:
       return exit_no_connection;
     case error_kind::tee:
+    case error_kind::companion:
       return exit_tee_error;
+    case error_kind::soter:
+      return exit_keymaster;
     case error_kind::keymaster:
       break;
   }
@@ -107,11 +132,9 @@ json failure_json(const std::exception& failed) {
   if (const auto* const of_tee = dynamic_cast<const error*>(&failed)) {
     const auto& facts = of_tee->facts();
     object["step"] = facts.step;
-    object["tee_result"] = {{"name", keymaster::client::tee_result_name(facts.tee_result)},
-                            {"value", facts.tee_result}};
+    object["tee_result"] = named(keymaster::client::tee_result_name(facts.tee_result), facts.tee_result);
     object["tee_origin"] = keymaster::client::tee_origin_name(facts.tee_origin);
-    object["keymaster_error"] = {{"name", keymaster::client::keymaster_error_name(facts.keymaster_error)},
-                                 {"value", facts.keymaster_error}};
+    add_refusal(object, facts);
   }
   return object;
 }

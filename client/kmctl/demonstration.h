@@ -18,8 +18,10 @@ namespace kmctl {
 
 /// Everything that the rounds leave in the folder.
 inline constexpr std::array demo_files{
-    "key.blob", "public.pem", "signature.bin", "ec.blob",   "ec-public.pem",   "ec-signature.bin", "hmac.blob",
-    "mac.bin",  "aes.blob",   "file.enc",      "oaep.blob", "oaep-public.pem", "secret.bin",       "secret.enc"};
+    "key.blob",          "public.pem", "signature.bin",  "ec.blob",       "ec-public.pem", "ec-signature.bin",
+    "hmac.blob",         "mac.bin",    "aes.blob",       "file.enc",      "oaep.blob",     "oaep-public.pem",
+    "secret.bin",        "secret.enc", "attk.pem",       "app.blob",      "app.statement", "app-statement.json",
+    "app-statement.sig", "auth.blob",  "auth.statement", "sign.statement"};
 
 /// Carries out steps one after the other, tells each with its time, and keeps what a program may want to read.
 class demonstration {
@@ -28,6 +30,7 @@ class demonstration {
   /// failure_error when something of these names is there without that, and usage_error when `file` is.
   demonstration(const context& ctx, std::string file, std::filesystem::path folder, bool force);
 
+  [[nodiscard]] keymaster::client::connection& tee() { return tee_.connection(); }
   [[nodiscard]] keymaster::client::session& ta() { return tee_.ta(); }
   [[nodiscard]] const std::string& tee_name() const { return tee_.name(); }
   [[nodiscard]] const std::string& file() const { return file_; }
@@ -94,6 +97,7 @@ void show_ec_signature(demonstration& demo);
 void show_mac(demonstration& demo);
 void show_file_encryption(demonstration& demo);
 void show_secret_transport(demonstration& demo);
+void show_attestation(demonstration& demo);
 
 }  // namespace kmctl
 

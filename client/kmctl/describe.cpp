@@ -29,7 +29,15 @@ std::string title_of(keymaster::keymaster_tag_t tag) {
   return row == nullptr ? fmt::format("tag-0x{:08x}", tag) : std::string(row->name);
 }
 
+/// A key's blob inside another key's characteristics is long, and says nothing to anybody but the TA.
+bool holds_blob(keymaster::keymaster_tag_t tag) {
+  return tag == keymaster::KM_TAG_SOTER_SIGNING_KEY_BLOB || tag == keymaster::KM_TAG_SOTER_SIGNING_KEY_NAME;
+}
+
 json value_of(const authorization& one) {
+  if (holds_blob(one.tag)) {
+    return {{"size", one.blob.size()}};
+  }
   if (keymaster::client::holds_bytes(one.tag)) {
     return to_hex(one.blob);
   }
@@ -48,6 +56,9 @@ json value_of(const authorization& one) {
 std::string text_of(const json& value) {
   if (value.is_boolean()) {
     return value.get<bool>() ? "yes" : "no";
+  }
+  if (value.is_object()) {
+    return format_size(value["size"].get<std::uint64_t>());
   }
   return value.is_string() ? value.get<std::string>() : value.dump();
 }

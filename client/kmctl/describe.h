@@ -13,7 +13,8 @@ namespace kmctl {
 [[nodiscard]] std::string describe_text(const keymaster::client::authorizations& list, std::size_t indent = 2);
 
 /// describe_json gives one member per tag, named as in the text with underscores. A tag that may be repeated, or is,
-/// has an array. Byte strings are hexadecimal, dates ISO 8601; a tag without a name is named by its number.
+/// has an array. Byte strings are hexadecimal, dates ISO 8601; of the blob of another key there is
+/// the "size" alone. A tag without a name is named by its number.
 [[nodiscard]] nlohmann::ordered_json describe_json(const keymaster::client::authorizations& list);
 
 /// key_title names the kind of key in a few characters: "RSA-2048".

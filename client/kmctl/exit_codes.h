@@ -12,10 +12,10 @@ enum exit_code : int {
   exit_done = 0,
   exit_failure = 1,        ///< a file can't be read or written, a key file isn't one, …
   exit_usage = 2,          ///< the command line doesn't make sense
-  exit_tee_error = 3,      ///< the TEE or the TA did not carry out the request
+  exit_tee_error = 3,      ///< the TEE or a TA did not carry out the request
   exit_keymaster = 4,      ///< the TA carried it out and refused
-  exit_no_connection = 5,  ///< no TEE, or no session with the TA
-  exit_invalid = 6,        ///< a signature, MAC or tag does not belong to the data
+  exit_no_connection = 5,  ///< no TEE, or no session with a TA
+  exit_invalid = 6,        ///< a signature, MAC or tag does not belong to the data, or a statement is refused
 };
 
 /// The codes as `kmctl --help` lists them.
@@ -26,8 +26,8 @@ inline constexpr const char* exit_code_help =
     "  2  wrong usage\n"
     "  3  TEE error: the request was not carried out\n"
     "  4  Keymaster error: the request was carried out and refused\n"
-    "  5  no connection to a TEE, or no session with the Keymaster TA\n"
-    "  6  signature, MAC or tag invalid\n";
+    "  5  no connection to a TEE, or no session with a TA\n"
+    "  6  signature, MAC, tag or statement invalid\n";
 
 /// The command line doesn't make sense. `hint` says what would.
 class usage_error : public std::runtime_error {

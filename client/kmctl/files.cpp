@@ -113,7 +113,15 @@ void refuse_overwriting(const std::string& output, const std::vector<std::string
 }
 
 void refuse_shared_input(std::initializer_list<const std::string*> inputs) {
-  if (std::ranges::count(inputs, "-", [](const std::string* path) { return *path; }) > 1) {
+  std::vector<std::string> paths;
+  for (const std::string* const path : inputs) {
+    paths.push_back(*path);
+  }
+  refuse_shared_inputs(paths);
+}
+
+void refuse_shared_inputs(const std::vector<std::string>& inputs) {
+  if (std::ranges::count(inputs, "-") > 1) {
     throw usage_error("only one input can come from standard input", "name a file for the others");
   }
 }

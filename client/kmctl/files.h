@@ -57,8 +57,10 @@ inline constexpr std::size_t small_file_limit = std::size_t{1} << 20;
 /// refuse_overwriting refuses an output that is one of the command's inputs under any name. Throws usage_error.
 void refuse_overwriting(const std::string& output, const std::vector<std::string>& inputs);
 
-/// refuse_shared_input refuses more than one "-" among the inputs of a command. Throws usage_error.
+/// refuse_shared_input and refuse_shared_inputs refuse more than one "-" among the inputs of a command. Throws
+/// usage_error.
 void refuse_shared_input(std::initializer_list<const std::string*> inputs);
+void refuse_shared_inputs(const std::vector<std::string>& inputs);
 
 }  // namespace kmctl
 

@@ -7,25 +7,41 @@
 
 #include "client/kmctl/context.h"
 #include "client/kmctl/files.h"
+#include "client/kmctl/user_presence.h"
 #include "client/lib/keys.h"
 #include "client/lib/operation.h"
 
 namespace kmctl {
 
-/// A sealed key and how it is used: what begin is told, and what update and finish are told again.
+/// A sealed key and how it is used: what begin is told, and what update and finish are told again. Without a user both
+/// are what stands here.
 struct key_use {
   byte_view blob;
   keymaster::client::application app;
   keymaster::client::authorizations parameters;
   keymaster::client::authorizations each_step;
   std::uint64_t algorithm = 0;
+  bool makes_statements = false;  ///< an attested key signs statements in place of messages
+  user_presence* user = nullptr;
 };
 
 /// make_key_use completes what the command line gave by what the key's characteristics leave no choice about. Throws
-/// keymaster::client::error, and usage_error when there is a choice. `blob` must outlive the result.
+/// keymaster::client::error, and usage_error when there is a choice, or `user` has nothing to do. `blob` and `user`
+/// must outlive the result.
 [[nodiscard]] key_use make_key_use(keymaster::client::session& ta, keymaster::keymaster_purpose_t purpose,
                                    byte_view blob, const keymaster::client::application& app,
-                                   const keymaster::client::authorizations& given);
+                                   const keymaster::client::authorizations& given, user_presence* user = nullptr);
+
+/// An operation that has begun, and what its further steps are told.
+struct key_operation {
+  keymaster::client::operation op;
+  keymaster::client::authorizations each_step;
+};
+
+/// begin_use begins an operation with the key, and has its user prove to be there. Throws keymaster::client::error, and
+/// what the user throws.
+[[nodiscard]] key_operation begin_use(keymaster::client::session& ta, keymaster::keymaster_purpose_t purpose,
+                                      const key_use& key);
 
 /// parameters_json gives what the key is used with under the names of the tags ("block_mode"), and parameters_text the
 /// same in a line: "gcm, 128 bits".
@@ -43,8 +59,7 @@ struct data_stream {
 
 /// feed puts the data through an operation up to finish, with a bar on the terminal while that lasts. Throws
 /// keymaster::client::error, and failure_error when the data can't be read.
-void feed(keymaster::client::operation& op, const key_use& key, const data_stream& data, const char* label,
-          const keymaster::client::byte_sink& sink);
+void feed(key_operation& running, const data_stream& data, const char* label, const keymaster::client::byte_sink& sink);
 
 }  // namespace kmctl
 

@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <charconv>
 #include <chrono>
 
@@ -133,6 +134,10 @@ bytes parse_bytes(const std::string& text) {
   }
   const byte_view raw = keymaster::client::as_bytes(text.starts_with("text:") ? text.c_str() + 5 : text.c_str());
   return {raw.begin(), raw.end()};
+}
+
+bool is_printable_ascii(std::string_view text) {
+  return std::ranges::all_of(text, [](char c) { return c >= ' ' && c <= '~'; });
 }
 
 std::optional<std::string> file_of_value(const std::string& text) {

@@ -28,6 +28,9 @@ using keymaster::client::date;
 /// file_of_value gives FILE when the text of a byte string is `@FILE`, and nothing otherwise.
 [[nodiscard]] std::optional<std::string> file_of_value(const std::string& text);
 
+/// is_printable_ascii tells whether a text has nothing but characters from blank to tilde.
+[[nodiscard]] bool is_printable_ascii(std::string_view text);
+
 /// parse_date reads ISO 8601: 2030-01-31, 2030-01-31T12:00, 2030-01-31T12:00:30.5, each with a Z or an offset such as
 /// +02:00 behind it if wanted; without one it is UTC. Throws usage_error, also for dates before 1970.
 [[nodiscard]] date parse_date(std::string_view text);

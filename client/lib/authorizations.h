@@ -76,6 +76,16 @@ class authorizations {
   authorizations& application_id(byte_view id) { return add(KM_TAG_APPLICATION_ID, id); }
   authorizations& application_data(byte_view data) { return add(KM_TAG_APPLICATION_DATA, data); }
 
+  /// soter_key makes a key one of the attestation framework. Its export statement is signed by the device's attestation
+  /// key or by another key's blob; counted puts the device's counter into it, and the uid the one given here.
+  authorizations& soter_key() { return add(KM_TAG_SOTER_KEY, 1); }
+  authorizations& soter_signed_by_attk() { return add(KM_TAG_SOTER_SIGNED_BY_ATTK, 1); }
+  authorizations& soter_signed_by_key() { return add(KM_TAG_SOTER_SIGNED_BY_KEY, 1); }
+  authorizations& soter_signing_key_blob(byte_view blob) { return add(KM_TAG_SOTER_SIGNING_KEY_BLOB, blob); }
+  authorizations& soter_signing_key_name(byte_view blob) { return add(KM_TAG_SOTER_SIGNING_KEY_NAME, blob); }
+  authorizations& soter_counted() { return add(KM_TAG_SOTER_COUNTED, 1); }
+  authorizations& soter_uid(std::uint32_t uid) { return add(KM_TAG_SOTER_UID, uid); }
+
   [[nodiscard]] std::size_t count(keymaster_tag_t tag) const;
   [[nodiscard]] bool contains(keymaster_tag_t tag) const { return count(tag) != 0; }
   /// numbers gives the values of a tag in order; unique_number its value when the tag occurs exactly once.

@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "client/lib/session.h"
+#include "client/lib/ta_session.h"
 
 namespace keymaster::client {
 
@@ -19,16 +19,13 @@ struct device_state {
   std::uint64_t ree_time;
 };
 
-/// A session with the TA "device information". Every call throws error with error_kind::tee when the TEE or the TA
-/// refuses it for another reason than those told.
+/// A session with the TA "device information". Every call throws error with error_kind::companion when the TEE or the
+/// TA refuses it for another reason than those told.
 class device_information {
  public:
   /// Opens the session. Throws error with error_kind::connection; TEEC_ERROR_ITEM_NOT_FOUND says that this TEE does not
   /// have the TA.
   explicit device_information(connection& tee);
-  device_information(const device_information&) = delete;
-  device_information& operator=(const device_information&) = delete;
-  ~device_information() { TEEC_CloseSession(&session_); }
 
   /// tee_property gives the text form of a property of the TEE (gpd.tee.…). Nothing: it has no such property.
   [[nodiscard]] std::optional<std::string> tee_property(std::string_view name);
@@ -40,7 +37,7 @@ class device_information {
   [[nodiscard]] device_state state();
 
  private:
-  TEEC_Session session_{};
+  ta_session session_;
 };
 
 }  // namespace keymaster::client

@@ -12,18 +12,23 @@ enum class error_kind {
   connection,  ///< no context or no session could be opened
   tee,         ///< the request was not carried out: the TEE result says why
   keymaster,   ///< the request was carried out and refused: the Keymaster error says why
+  soter,       ///< an attestation command was carried out and refused: the status says why
+  companion,   ///< another TA than the Keymaster TA did not do what was asked: the TEE result says why
 };
 
-/// The facts of one failure. `step` is the command's name, or "connect" or "open_session".
+/// The facts of one failure. `step` is the command's name, "connect", "open_session", or "open_" and the name of
+/// another TA than the Keymaster TA.
 struct failure {
   error_kind kind;
   std::string step;
   std::uint32_t tee_result = 0;
   std::uint32_t tee_origin = 0;
   std::int32_t keymaster_error = 0;
+  std::int32_t soter_status = 0;  ///< of soter_status_t, or a Keymaster error
+  std::uint32_t wait_ms = 0;      ///< for how long the TA refuses this, when it says so
 };
 
-/// Thrown by every call of this library that the TEE or the TA refuses. what() names the step and both levels;
+/// Thrown by every call of this library that the TEE or the TA refuses. what() names the step and what both levels say;
 /// hint() says what to try.
 class error : public std::runtime_error {
  public:

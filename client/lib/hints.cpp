@@ -5,6 +5,7 @@
 
 #include "client/lib/error.h"
 #include "src/params/keymaster_defs.h"
+#include "src/params/keymaster_protocol.h"
 #include "tee_client_api.h"
 
 namespace keymaster::client {
@@ -12,12 +13,25 @@ namespace {
 
 constexpr std::uint32_t tee_error_mac_invalid = 0xFFFF3071;
 constexpr std::uint32_t tee_error_storage_no_space = 0xFFFF3041;
+constexpr std::uint32_t tee_error_overflow = 0xFFFF300F;
 constexpr std::uint32_t ksk_error_deleted = 0xF0100001;
 constexpr std::uint32_t ksk_error_rpmb_gone = 0xF0100003;
 
 /// Where nothing better is known.
 constexpr std::string_view look_at_the_trace =
     "run it again with KEYMASTER_TRACE=error (kmctl --trace error): the trace names the call that failed";
+
+// What more than one step is answered with.
+constexpr std::string_view no_companion =
+    "the TEE has no image of this TA: build it, or point KEYMASTER_TA_PATH at the folder of the .ta files";
+constexpr std::string_view device_is_locked = "the device is locked: its key and its properties stay as they are";
+constexpr std::string_view no_such_finger = "no finger has this id: kmctl finger list shows those that are enrolled";
+constexpr std::string_view wrong_password =
+    "the password is wrong, or the handle is not one of this user on this device; after five failures in a row there "
+    "is a wait";
+constexpr std::string_view wait_for_the_password =
+    "too many wrong passwords in a row: until the time has passed the right one is refused as well; it begins anew "
+    "whenever the secure world starts (kmctl: --wait sits it out)";
 
 struct tee_advice {
   std::string_view step;
@@ -51,6 +65,25 @@ constexpr std::array tee_advices = std::to_array<tee_advice>({
     {"open_session", ksk_error_deleted,
      "the stored key storage key was malformed and is deleted now; the next start makes a new one, and blobs sealed "
      "under the old one are lost"},
+    {"open_provisioning", TEEC_ERROR_ITEM_NOT_FOUND, no_companion},
+    {"open_fingerprint", TEEC_ERROR_ITEM_NOT_FOUND, no_companion},
+    {"open_authenticator", TEEC_ERROR_ITEM_NOT_FOUND, no_companion},
+    {"open_device_information", TEEC_ERROR_ITEM_NOT_FOUND,
+     "this TEE offers no TA that tells its properties, which a factory record needs"},
+    {"generate_attk", TEEC_ERROR_ACCESS_DENIED, device_is_locked},
+    {"put_key", TEEC_ERROR_ACCESS_DENIED, device_is_locked},
+    {"put_property", TEEC_ERROR_ACCESS_DENIED, device_is_locked},
+    {"lock_device", TEEC_ERROR_ACCESS_DENIED, device_is_locked},
+    {"put_key", TEEC_ERROR_BAD_FORMAT, "the TA does not take the key: client and TA are of different versions"},
+    {"enrol_finger", TEEC_ERROR_BAD_PARAMETERS, "a finger belongs to a user: the secure id 0 stands for nobody"},
+    {"enrol_finger", tee_error_overflow, "no more fingers fit in: remove one first"},
+    {"touch_finger", TEEC_ERROR_ITEM_NOT_FOUND, no_such_finger},
+    {"remove_finger", TEEC_ERROR_ITEM_NOT_FOUND, no_such_finger},
+    {"enrol_password", TEEC_ERROR_ACCESS_DENIED, wrong_password},
+    {"verify_password", TEEC_ERROR_ACCESS_DENIED, wrong_password},
+    {"enrol_password", TEEC_ERROR_BUSY, wait_for_the_password},
+    {"verify_password", TEEC_ERROR_BUSY, wait_for_the_password},
+    {"enrol_password", TEEC_ERROR_BAD_PARAMETERS, "a password has 1 to 1024 bytes"},
     {"", tee_error_mac_invalid,
      "the blob does not authenticate: it was altered, or another device sealed it (another state folder)"},
     {"", ksk_error_rpmb_gone, "the blob was sealed with the RPMB key, and this device has no RPMB storage now"},
@@ -89,8 +122,7 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
     {"", KM_ERROR_UNSUPPORTED_ALGORITHM, "the TA does not offer this algorithm: kmctl info lists what it offers"},
     {"", KM_ERROR_UNSUPPORTED_KEY_SIZE,
      "choose a size of this algorithm: RSA takes multiples of 8 up to 8192 bits, EC 192, 224, 256, 384 or 521, AES "
-     "128, "
-     "192 or 256; HMAC takes multiples of 8 from what its digest demands (192 for sha-256) up to 512 or 1024"},
+     "128, 192 or 256; HMAC takes multiples of 8 from what its digest demands (192 for sha-256) up to 512 or 1024"},
     {"", KM_ERROR_UNSUPPORTED_BLOCK_MODE,
      "the algorithm does not offer this block mode: kmctl info lists those it does"},
     {"", KM_ERROR_INCOMPATIBLE_BLOCK_MODE, "the key does not allow this block mode: look at its characteristics"},
@@ -113,7 +145,9 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
     {"", KM_ERROR_INVALID_INPUT_LENGTH, "the input is longer than this key can take at once"},
     {"", KM_ERROR_KEY_NOT_YET_VALID, "the key's active date lies ahead: check the clock"},
     {"", KM_ERROR_KEY_EXPIRED, "the key's date for this purpose has passed: make a new key"},
-    {"", KM_ERROR_KEY_USER_NOT_AUTHENTICATED, "the key's user must authenticate: pass a fresh auth token"},
+    {"", KM_ERROR_KEY_USER_NOT_AUTHENTICATED,
+     "the key's user must authenticate, in the way that the key asks for: pass a fresh auth token (kmctl: --finger, or "
+     "--auth-handle)"},
     {"", KM_ERROR_INVALID_OPERATION_HANDLE, "the operation has ended (any failure ends it): begin again"},
     {"", KM_ERROR_VERIFICATION_FAILED,
      "the signature, MAC or tag is not one of this key over this input: check that they belong together, with padding, "
@@ -129,8 +163,7 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
      "name algorithm, size and (for RSA) the public exponent exactly once, and do not state an origin"},
     {"begin", KM_ERROR_INVALID_ARGUMENT,
      "name padding, digest, block mode and MAC length exactly once; a nonce has 12 bytes for gcm and 16 for cbc and "
-     "ctr; "
-     "a key with a user id needs an auth type; an auth token must be of this boot"},
+     "ctr; a key with a user id needs an auth type; an auth token must be of this boot"},
     {"finish", KM_ERROR_INVALID_ARGUMENT,
      "the text has not the padding that it must have: key, padding, digest and nonce must be those of the encryption, "
      "and the ciphertext unchanged and whole (without padding, RSA takes a number below the key's modulus)"},
@@ -146,8 +179,31 @@ constexpr std::array keymaster_advices = std::to_array<keymaster_advice>({
     {"", -58, "state a minimum MAC length: gcm keys need one"},
     {"", KM_ERROR_UNSUPPORTED_MIN_MAC_LENGTH,
      "the minimum MAC length must be a multiple of 8: for gcm 96 to 128, for HMAC 64 to the digest's length"},
-    {"finish", KM_ERROR_UNKNOWN_ERROR, "a MAC is at most as long as its digest: ask for a shorter one"},
+    {"finish", KM_ERROR_UNKNOWN_ERROR,
+     "a MAC is at most as long as its digest: ask for a shorter one; a statement takes a text of some tens of "
+     "kilobytes, "
+     "and a key that signs with a digest"},
     {"", KM_ERROR_UNIMPLEMENTED, "the algorithm does not have this step: leave it out"},
+});
+
+struct soter_advice {
+  std::string_view step;
+  std::int32_t status;
+  std::string_view text;
+};
+
+constexpr std::array soter_advices = std::to_array<soter_advice>({
+    {"", SOTER_STATUS_NO_ATTK,
+     "the device has no attestation key that can be used: kmctl device provision puts one in"},
+    {"", SOTER_STATUS_UNREADABLE_ATTK,
+     "the attestation key can't be read: kmctl device status tells what is there, and unless the device is locked it "
+     "can be provisioned again"},
+    {"soter_generate_attk_key_pair", KM_ERROR_UNKNOWN_ERROR,
+     "the attestation key or a property is missing: kmctl device status tells which, kmctl device provision puts it "
+     "in"},
+    {"soter_get_device_id", KM_ERROR_UNKNOWN_ERROR, "the device has no id: kmctl device provision gives it one"},
+    {"soter_get_device_id", KM_ERROR_INSUFFICIENT_BUFFER_SPACE,
+     "the device's id is longer than this client expects: client and TA are of different versions"},
 });
 
 }  // namespace
@@ -158,6 +214,12 @@ std::string hint_for(const failure& facts) {
     const auto row = std::ranges::find_if(
         tee_advices, [&](const tee_advice& advice) { return advice.result == facts.tee_result && fits(advice.step); });
     return std::string(row == tee_advices.end() ? look_at_the_trace : row->text);
+  }
+  if (facts.kind == error_kind::soter) {
+    const auto row = std::ranges::find_if(soter_advices, [&](const soter_advice& advice) {
+      return advice.status == facts.soter_status && fits(advice.step);
+    });
+    return std::string(row == soter_advices.end() ? look_at_the_trace : row->text);
   }
   const auto row = std::ranges::find_if(keymaster_advices, [&](const keymaster_advice& advice) {
     return advice.error == facts.keymaster_error && fits(advice.step);

@@ -162,6 +162,17 @@ bytes ec_point(byte_view x, byte_view y, std::uint32_t bits) {
   return point;
 }
 
+bytes built_public_key_der(const char* type, const param_bld_ptr& builder, const char* otherwise) {
+  const params_ptr params(OSSL_PARAM_BLD_to_param(builder.get()));
+  const pkey_ctx_ptr context(EVP_PKEY_CTX_new_from_name(nullptr, type, nullptr));
+  EVP_PKEY* raw = nullptr;
+  if (params == nullptr || context == nullptr || EVP_PKEY_fromdata_init(context.get()) != 1 ||
+      EVP_PKEY_fromdata(context.get(), &raw, EVP_PKEY_PUBLIC_KEY, params.get()) != 1) {
+    refuse(otherwise);
+  }
+  return encode_public_key(pkey_ptr(raw).get());
+}
+
 bytes ec_public_key_der(byte_view exported) {
   byte_reader in{exported};
   const std::uint32_t bits = in.read_u32();
@@ -176,14 +187,11 @@ bytes ec_public_key_der(byte_view exported) {
   const param_bld_ptr builder(OSSL_PARAM_BLD_new());
   OSSL_PARAM_BLD_push_utf8_string(builder.get(), OSSL_PKEY_PARAM_GROUP_NAME, row->name.data(), row->name.size());
   OSSL_PARAM_BLD_push_octet_string(builder.get(), OSSL_PKEY_PARAM_PUB_KEY, point.data(), point.size());
-  const params_ptr params(OSSL_PARAM_BLD_to_param(builder.get()));
-  const pkey_ctx_ptr context(EVP_PKEY_CTX_new_from_name(nullptr, "EC", nullptr));
-  EVP_PKEY* raw = nullptr;
-  if (params == nullptr || context == nullptr || EVP_PKEY_fromdata_init(context.get()) != 1 ||
-      EVP_PKEY_fromdata(context.get(), &raw, EVP_PKEY_PUBLIC_KEY, params.get()) != 1) {
-    refuse("the exported key is not a point of its curve");
-  }
-  return encode_public_key(pkey_ptr(raw).get());
+  return built_public_key_der("EC", builder, "the exported key is not a point of its curve");
+}
+
+bignum_ptr read_bignum(byte_view magnitude) {
+  return bignum_ptr(BN_bin2bn(magnitude.data(), static_cast<int>(magnitude.size()), nullptr));
 }
 
 }  // namespace
@@ -223,6 +231,16 @@ std::string public_key_pem(keymaster_algorithm_t algorithm, byte_view exported) 
   const char* text = nullptr;
   const long length = BIO_get_mem_data(out.get(), &text);
   return {text, static_cast<std::size_t>(length)};
+}
+
+bytes public_half_der(const private_key_material& rsa_key) {
+  byte_reader in{rsa_key.material};
+  const bignum_ptr modulus = read_bignum(in.read_block());
+  const bignum_ptr exponent = read_bignum(in.read_block());
+  const param_bld_ptr builder(OSSL_PARAM_BLD_new());
+  OSSL_PARAM_BLD_push_BN(builder.get(), OSSL_PKEY_PARAM_RSA_N, modulus.get());
+  OSSL_PARAM_BLD_push_BN(builder.get(), OSSL_PKEY_PARAM_RSA_E, exponent.get());
+  return built_public_key_der("RSA", builder, "the key has no public half");
 }
 
 }  // namespace keymaster::client

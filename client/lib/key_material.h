@@ -36,6 +36,9 @@ struct private_key_material {
 [[nodiscard]] bytes public_key_der(keymaster_algorithm_t algorithm, byte_view exported);
 [[nodiscard]] std::string public_key_pem(keymaster_algorithm_t algorithm, byte_view exported);
 
+/// public_half_der gives the public half of an RSA key as a SubjectPublicKeyInfo in DER. Throws format_error.
+[[nodiscard]] bytes public_half_der(const private_key_material& rsa_key);
+
 }  // namespace keymaster::client
 
 #endif  // KEYMASTER_CLIENT_LIB_KEY_MATERIAL_H_

@@ -74,6 +74,12 @@ constexpr std::array tags = std::to_array<tag_name>({
     {KM_TAG_ASSOCIATED_DATA, "associated-data", {}},
     {KM_TAG_NONCE, "nonce", {}},
     {KM_TAG_SOTER_KEY, "soter-key", {}},
+    {KM_TAG_SOTER_SIGNED_BY_ATTK, "soter-signed-by-attk", {}},
+    {KM_TAG_SOTER_SIGNED_BY_KEY, "soter-signed-by-key", {}},
+    {KM_TAG_SOTER_SIGNING_KEY_NAME, "soter-signing-key-name", {}},
+    {KM_TAG_SOTER_COUNTED, "soter-counted", {}},
+    {KM_TAG_SOTER_UID, "soter-uid", {}},
+    {KM_TAG_SOTER_SIGNING_KEY_BLOB, "soter-signing-key-blob", {}},
 });
 
 #define NAMED(constant) \
@@ -115,6 +121,9 @@ constexpr std::array keymaster_errors = std::to_array<named_value>({
     NAMED(KM_ERROR_UNIMPLEMENTED),
     NAMED(KM_ERROR_UNKNOWN_ERROR),
 });
+
+constexpr std::array soter_statuses = std::to_array<named_value>(
+    {NAMED(SOTER_STATUS_OK), NAMED(SOTER_STATUS_NO_ATTK), NAMED(SOTER_STATUS_UNREADABLE_ATTK)});
 
 #undef NAMED
 
@@ -180,6 +189,11 @@ constexpr std::array commands = std::to_array<named_value>({
     {KM_COMMAND_DELETE_KEY, "delete_key"},
     {KM_COMMAND_DELETE_ALL_KEY, "delete_all_key"},
     {KM_COMMAND_ABORT, "abort"},
+    {KM_COMMAND_SOTER_GENERATE_ATTK_KEY_PAIR, "soter_generate_attk_key_pair"},
+    {KM_COMMAND_SOTER_VERIFY_ATTK_KEY_PAIR, "soter_verify_attk_key_pair"},
+    {KM_COMMAND_SOTER_EXPORT_ATTK_PUBLIC_KEY, "soter_export_attk_public_key"},
+    {KM_COMMAND_SOTER_GET_DEVICE_ID, "soter_get_device_id"},
+    {KM_COMMAND_SOTER_SET_FID, "soter_set_fid"},
 });
 
 std::string name_or(name_table table, std::uint32_t value, const std::string& otherwise) {
@@ -224,6 +238,10 @@ std::optional<std::uint32_t> value_of(name_table table, std::string_view name) {
 
 std::string keymaster_error_name(std::int32_t error) {
   return name_or(keymaster_errors, static_cast<std::uint32_t>(error), "KM_ERROR(" + std::to_string(error) + ")");
+}
+
+std::string soter_status_name(std::int32_t status) {
+  return name_or(soter_statuses, static_cast<std::uint32_t>(status), keymaster_error_name(status));
 }
 
 std::string tee_result_name(std::uint32_t result) {

@@ -48,6 +48,9 @@ extern const std::span<const tag_name> tag_names;
 /// keymaster_error_name: "KM_ERROR_INVALID_KEY_BLOB", or "KM_ERROR(-7777)" for a number without a name.
 [[nodiscard]] std::string keymaster_error_name(std::int32_t error);
 
+/// soter_status_name: "SOTER_STATUS_NO_ATTK", and else the name of the Keymaster error.
+[[nodiscard]] std::string soter_status_name(std::int32_t status);
+
 /// tee_result_name: "TEE_ERROR_MAC_INVALID", or "TEE_Result(0x12345678)". The TA's own two results are
 /// KSK_ERROR_DELETED and KSK_ERROR_RPMB_GONE; they share their numbers with two results of the platform's storage that
 /// never reach a client.

@@ -18,53 +18,36 @@ std::int32_t error_beside_result(const invocation& what, std::uint32_t a) {
 
 }  // namespace
 
-connection::connection(const std::string& name) {
-  const TEEC_Result result = TEEC_InitializeContext(name.empty() ? nullptr : name.c_str(), &context_);
-  if (result != TEEC_SUCCESS) {
-    throw error(
-        {.kind = error_kind::connection, .step = "connect", .tee_result = result, .tee_origin = TEEC_ORIGIN_API});
-  }
-}
+session::session(connection& tee) : session_(tee, keymaster_ta, "open_session") {}
 
-session::session(connection& tee) {
-  std::uint32_t origin = 0;
-  const TEEC_Result result =
-      TEEC_OpenSession(&tee.context(), &session_, &keymaster_ta, TEEC_LOGIN_PUBLIC, nullptr, nullptr, &origin);
-  if (result != TEEC_SUCCESS) {
-    throw error({.kind = error_kind::connection, .step = "open_session", .tee_result = result, .tee_origin = origin});
-  }
-}
-
-reply session::call_plain(const invocation& what) {
-  TEEC_Operation operation{};
+reply session::carry_out(const invocation& what, const slot& words) {
   reply answer;
-  operation.paramTypes = TEEC_PARAM_TYPES(TEEC_VALUE_INOUT, what.request ? TEEC_MEMREF_TEMP_INPUT : TEEC_NONE,
-                                          what.response_capacity ? TEEC_MEMREF_TEMP_OUTPUT : TEEC_NONE, TEEC_NONE);
-  operation.params[0].value = {.a = what.a, .b = what.b};
+  slots parameters{words};
   if (what.request) {
-    // The standard's structure serves both directions and so has no const; an input buffer is only read.
-    operation.params[1].tmpref = {.buffer = const_cast<std::uint8_t*>(what.request->data()),
-                                  .size = what.request->size()};
+    parameters[1] = slot::bytes_in(*what.request);
   }
   if (what.response_capacity) {
     answer.body.resize(*what.response_capacity);
-    operation.params[2].tmpref = {.buffer = answer.body.data(), .size = answer.body.size()};
+    parameters[2] = slot::bytes_out(answer.body);
   }
-  std::uint32_t origin = 0;
-  const TEEC_Result result = TEEC_InvokeCommand(&session_, what.command, &operation, &origin);
-  answer.a = operation.params[0].value.a;
-  answer.b = operation.params[0].value.b;
-  if (result != TEEC_SUCCESS) {
+  const outcome done = session_.invoke(what.command, parameters);
+  answer.a = parameters[0].value().a;
+  answer.b = parameters[0].value().b;
+  if (done.result != TEEC_SUCCESS) {
     throw error({.kind = error_kind::tee,
                  .step = command_name(what.command),
-                 .tee_result = result,
-                 .tee_origin = origin,
+                 .tee_result = done.result,
+                 .tee_origin = done.origin,
                  .keymaster_error = error_beside_result(what, answer.a)});
   }
   if (what.response_capacity) {
-    answer.body.resize(std::min(operation.params[2].tmpref.size, answer.body.size()));
+    answer.body.resize(std::min(parameters[2].size(), answer.body.size()));
   }
   return answer;
+}
+
+reply session::call_plain(const invocation& what) {
+  return carry_out(what, slot::value_inout(what.a, what.b));
 }
 
 reply session::call(const invocation& what) {
@@ -75,6 +58,19 @@ reply session::call(const invocation& what) {
                  .tee_result = TEEC_SUCCESS,
                  .tee_origin = TEEC_ORIGIN_TRUSTED_APP,
                  .keymaster_error = keymaster_error});
+  }
+  return answer;
+}
+
+reply session::call_soter(const invocation& what) {
+  // Those that write a response take no words.
+  reply answer = carry_out(what, what.response_capacity ? slot::value_out() : slot::value_inout(what.a, what.b));
+  if (const auto status = static_cast<std::int32_t>(answer.a); status != SOTER_STATUS_OK) {
+    throw error({.kind = error_kind::soter,
+                 .step = command_name(what.command),
+                 .tee_result = TEEC_SUCCESS,
+                 .tee_origin = TEEC_ORIGIN_TRUSTED_APP,
+                 .soter_status = status});
   }
   return answer;
 }

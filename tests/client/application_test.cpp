@@ -142,12 +142,16 @@ TEST_F(ApplicationTest, ASpinnerTurnsAndGoesAway) {
     const redirection error(STDERR_FILENO, screen.follower);
     const spinner quick("Quick");
   }
+  std::string shown;
   {
     const redirection error(STDERR_FILENO, screen.follower);
     const spinner slow("Working");
-    std::this_thread::sleep_for(std::chrono::milliseconds(500));
+    // It turns when the machine has time for it; reading waits for something to be shown.
+    while (shown.find("Working /") == std::string::npos) {
+      shown += screen.shown();
+    }
   }
-  const std::string shown = screen.shown();
+  shown += screen.shown();
   EXPECT_EQ(shown.find("Quick"), std::string::npos);
   EXPECT_NE(shown.find("\r\x1b[KWorking |  0."), std::string::npos) << shown;
   EXPECT_NE(shown.find("Working /"), std::string::npos) << shown;

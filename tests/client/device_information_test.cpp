@@ -64,7 +64,7 @@ TEST_F(DeviceInformationClientTest, AbsentPropertiesAreNothingAndOtherRefusalsAr
     (void)information.ta_property(keymaster_ta, "name");
     FAIL();
   } catch (const error& refused) {
-    EXPECT_EQ(refused.kind(), error_kind::tee);
+    EXPECT_EQ(refused.kind(), error_kind::companion);
     EXPECT_EQ(refused.facts().step, "get_ta_property");
     EXPECT_EQ(refused.facts().tee_result, TEEC_ERROR_TARGET_DEAD);
     EXPECT_EQ(refused.facts().tee_origin, TEEC_ORIGIN_TEE);

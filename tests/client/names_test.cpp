@@ -155,6 +155,67 @@ TEST(Errors, EveryResultThatAClientMeetsHasAHintOfItsOwn) {
   }
 }
 
+// What the other TAs are known to answer, and when.
+TEST(Errors, EveryResultOfACompanionHasAHintOfItsOwn) {
+  struct row {
+    const char* step;
+    error_kind kind;
+    std::uint32_t result;
+  };
+  constexpr std::uint32_t overflow = 0xFFFF300F;
+  for (const auto& [step, kind, result] : std::vector<row>{
+           {"open_provisioning", error_kind::connection, TEEC_ERROR_ITEM_NOT_FOUND},
+           {"open_fingerprint", error_kind::connection, TEEC_ERROR_ITEM_NOT_FOUND},
+           {"open_authenticator", error_kind::connection, TEEC_ERROR_ITEM_NOT_FOUND},
+           {"open_device_information", error_kind::connection, TEEC_ERROR_ITEM_NOT_FOUND},
+           {"generate_attk", error_kind::companion, TEEC_ERROR_ACCESS_DENIED},
+           {"put_key", error_kind::companion, TEEC_ERROR_ACCESS_DENIED},
+           {"put_key", error_kind::companion, TEEC_ERROR_BAD_FORMAT},
+           {"put_property", error_kind::companion, TEEC_ERROR_ACCESS_DENIED},
+           {"lock_device", error_kind::companion, TEEC_ERROR_ACCESS_DENIED},
+           {"enrol_finger", error_kind::companion, TEEC_ERROR_BAD_PARAMETERS},
+           {"enrol_finger", error_kind::companion, overflow},
+           {"touch_finger", error_kind::companion, TEEC_ERROR_ITEM_NOT_FOUND},
+           {"remove_finger", error_kind::companion, TEEC_ERROR_ITEM_NOT_FOUND},
+           {"enrol_password", error_kind::companion, TEEC_ERROR_ACCESS_DENIED},
+           {"enrol_password", error_kind::companion, TEEC_ERROR_BAD_PARAMETERS},
+           {"enrol_password", error_kind::companion, TEEC_ERROR_BUSY},
+           {"verify_password", error_kind::companion, TEEC_ERROR_ACCESS_DENIED},
+           {"verify_password", error_kind::companion, TEEC_ERROR_BUSY},
+       }) {
+    const std::string hint = hint_for({.kind = kind, .step = step, .tee_result = result});
+    EXPECT_NE(hint, in_the_trace) << step << ": " << tee_result_name(result);
+    EXPECT_NE(hint, hint_for({.kind = kind, .step = "begin", .tee_result = result})) << step;
+  }
+}
+
+TEST(Errors, EveryStatusOfTheAttestationCommandsHasAHintOfItsOwn) {
+  for (const auto& [step, status] : std::vector<std::pair<const char*, std::int32_t>>{
+           {"soter_generate_attk_key_pair", KM_ERROR_UNKNOWN_ERROR},
+           {"soter_verify_attk_key_pair", SOTER_STATUS_NO_ATTK},
+           {"soter_verify_attk_key_pair", SOTER_STATUS_UNREADABLE_ATTK},
+           {"soter_export_attk_public_key", SOTER_STATUS_NO_ATTK},
+           {"soter_get_device_id", KM_ERROR_UNKNOWN_ERROR},
+           {"soter_get_device_id", KM_ERROR_INSUFFICIENT_BUFFER_SPACE},
+       }) {
+    const std::string hint = hint_for({.kind = error_kind::soter, .step = step, .soter_status = status});
+    EXPECT_NE(hint, in_the_trace) << step << " " << status;
+    // The numbers overlap with the Keymaster errors, whose advice would be wrong.
+    EXPECT_NE(hint, hint_for({.kind = error_kind::keymaster, .step = step, .keymaster_error = status}));
+  }
+  EXPECT_EQ(hint_for({.kind = error_kind::soter, .step = "soter_get_device_id", .soter_status = -7777}), in_the_trace);
+}
+
+TEST(Names, AStatusOfTheAttestationCommandsHasItsOwnNameOrThatOfTheKeymasterError) {
+  EXPECT_EQ(soter_status_name(0), "SOTER_STATUS_OK");
+  EXPECT_EQ(soter_status_name(-1), "SOTER_STATUS_NO_ATTK");
+  EXPECT_EQ(soter_status_name(-2), "SOTER_STATUS_UNREADABLE_ATTK");
+  EXPECT_EQ(soter_status_name(-29), "KM_ERROR_INSUFFICIENT_BUFFER_SPACE");
+  EXPECT_EQ(soter_status_name(-7777), "KM_ERROR(-7777)");
+  EXPECT_EQ(command_name(0xFF00), "soter_generate_attk_key_pair");
+  EXPECT_EQ(command_name(0xFF03), "soter_get_device_id");
+}
+
 TEST(Errors, ADamagedStateOrImageIsToldByItsFile) {
   const auto hint = [](const char* step) {
     return hint_for({.kind = error_kind::connection, .step = step, .tee_result = TEEC_ERROR_BAD_FORMAT});

@@ -10,6 +10,7 @@ import datetime
 import json
 import os
 import pty
+import re
 import subprocess
 
 from kmctl_case import (DIGESTS, DONE, FAILURE, INVALID, KEYMASTER, NO_CONNECTION, TEE_ERROR, USAGE, KmctlTest, main,
@@ -479,7 +480,8 @@ class Devices(KmctlTest):
 class Demo(KmctlTest):
     STEPS = ["generate", "export", "sign", "verify", "openssl", "tampered_file", "tampered_blob", "ec_sign",
              "ec_openssl", "mac", "mac_openssl", "encrypt", "decrypt", "tampered_ciphertext", "openssl_encrypt",
-             "decrypt_secret"]
+             "decrypt_secret", "provision", "app_key", "statement_openssl", "auth_key", "sign_statement",
+             "verify_statement", "altered_statement"]
 
     def test_the_demo_shows_every_step_and_leaves_what_openssl_can_check(self):
         told = self.json("demo", self.data, "-o", self.path("shown"))
@@ -492,16 +494,49 @@ class Demo(KmctlTest):
         self.assertIn(results["mac"].strip(), results["mac_openssl"])
         self.assertIn("KM_ERROR_VERIFICATION_FAILED", results["tampered_ciphertext"])
         self.assertIn(self.read("shown/secret.bin").hex(), results["decrypt_secret"])
+        self.assertIn("Verified OK", results["statement_openssl"])
+        self.assertIn("(signature)", results["altered_statement"])
+        self.check_statements(results["verify_statement"])
         repeated = subprocess.run(told["commands"][0], shell=True, capture_output=True, check=True)
         self.assertIn(b"Verified OK", repeated.stdout)
         self.kmctl("verify", told["blob"], told["signature"], self.data)
+
+    def check_statements(self, told):
+        """The demo's chain, without kmctl: a parser of JSON, and openssl over the exact bytes."""
+        def parts(name):
+            data = self.read(f"shown/{name}.statement")
+            length = int.from_bytes(data[:4], "little")
+            return data[4:4 + length], data[4 + length:]
+
+        signer = self.path("shown/attk.pem")
+        for name, options in (("app", []), ("auth", []), ("sign", ["-sigopt", "rsa_padding_mode:pss"])):
+            text, signature = parts(name)
+            self.write("text", text)
+            self.write("signature", signature)
+            subprocess.run(["openssl", "dgst", "-sha256", *options, "-verify", signer, "-signature",
+                            self.path("signature"), self.path("text")], check=True, capture_output=True)
+            if name != "sign":
+                signer = self.write("signer.pem", json.loads(text)["pub_key"].encode())
+        message = json.loads(text.rstrip(b"\0"))
+        self.assertIn(f"finger {message['fid']}, uid 10001, counter {message['counter']}, device {message['cpu_id']}", told)
+        self.assertIn("pay 10 to Mary", message["raw"])
+
+    def test_a_second_demo_goes_on_with_the_same_device(self):
+        first = self.json("demo", self.data, "-o", self.path("first"))
+        second = self.json("demo", self.data, "-o", self.path("second"))
+        self.assertEqual(self.read("first/attk.pem"), self.read("second/attk.pem"))
+        told = {step["step"]: step["result"] for step in second["steps"]}
+        self.assertIn("has an attestation key already", told["provision"])
+        before = {step["step"]: step["result"] for step in first["steps"]}
+        counters = [int(re.search(r"counter (\d+)", text["verify_statement"])[1]) for text in (before, told)]
+        self.assertEqual(counters[1], counters[0] + 3)
 
     def test_the_demo_works_in_plain_words_on_any_file(self):
         for name, content in {"empty": b"", "it's a file": b"x", "large": bytes(300000)}.items():
             with self.subTest(name):
                 told = self.kmctl("demo", self.write(name, content), "-o", self.path("of " + name)).stdout.decode()
-                self.assertEqual(told.count("Refused, as it must be"), 3)
-                self.assertEqual(told.count("Verified OK"), 2)
+                self.assertEqual(told.count("Refused, as it must be"), 4)
+                self.assertEqual(told.count("Verified OK"), 3)
                 self.assertIn(f"the file came back ({len(content):,} byte", told)
                 self.assertRegex(told, r"1\. Generate an RSA-2048 key inside the TEE \([0-9.]+ ms\)")
 
@@ -577,11 +612,13 @@ class Terminal(KmctlTest):
 class Help(KmctlTest):
     def test_help_teaches(self):
         told = self.kmctl("--help").stdout.decode()
-        for words in ("Exit codes:", "6  signature, MAC or tag invalid", "KEYMASTER_STATE", "demo"):
+        for words in ("Exit codes:", "6  signature, MAC, tag or statement invalid", "KEYMASTER_STATE", "demo"):
             self.assertIn(words, told)
         for command in ("info", "generate", "import", "export", "characteristics", "sign", "verify", "encrypt",
-                        "decrypt", "delete", "delete-all", "demo"):
-            self.assertIn(f"Examples:\n  ", self.kmctl(command, "--help").stdout.decode(), command)
+                        "decrypt", "delete", "delete-all", "demo", "device provision", "device status",
+                        "attest status", "attest export-attk", "attest device-id", "finger enrol", "finger touch",
+                        "finger list", "finger remove", "auth enrol", "auth token", "statement verify"):
+            self.assertIn(f"Examples:\n  ", self.kmctl(*command.split(), "--help").stdout.decode(), command)
         self.assertRegex(self.kmctl("--version").stdout.decode(), r"^kmctl \d+\.\d+\.\d+\n$")
 
 

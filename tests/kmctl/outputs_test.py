@@ -37,6 +37,7 @@ class StandardOutput(StreamsTest):
                 ["characteristics", blob], ["characteristics", "--json", blob], ["sign", blob, self.data, "-o", made[3]],
                 ["verify", blob, self.path("sig"), self.data], ["verify", "--json", blob, self.path("sig"), self.data],
                 ["encrypt", aes, self.data, "-o", made[4]], ["decrypt", aes, self.path("enc"), "-o", made[5]],
+                ["device", "status"], ["attest", "status"], ["finger", "list"], ["finger", "enrol", "1"],
                 ["delete-all"], ["demo", self.data, "-o", made[6]], ["--help"], ["sign", "--help"], ["--version"],
                 ["delete", blob]]
 

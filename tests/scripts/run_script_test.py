@@ -121,9 +121,9 @@ class RunScript(ScriptTest):
         self.demo()
         self.assertEqual(self.called("cmake"), [
             "cmake --preset release -DKEYMASTER_TESTS=OFF -DKEYMASTER_BENCH=OFF",
-            "cmake --build --preset release --target kmctl keymaster_ta_image"])
+            "cmake --build --preset release --target kmctl trusted_applications"])
         self.demo()
-        self.assertEqual(self.called("cmake"), ["cmake --build --preset release --target kmctl keymaster_ta_image"])
+        self.assertEqual(self.called("cmake"), ["cmake --build --preset release --target kmctl trusted_applications"])
         self.assertEqual(self.called("apt-get"), [])
 
     def test_a_failure_stops_it_and_is_shown(self):
