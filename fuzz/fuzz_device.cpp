@@ -79,10 +79,14 @@ void fuzz_device::open() {
   world_->clock().set_system({7200, 250});
   world_->clock().set_ree({1'700'000'000, 500});
   world_->faults().clear();
+  session_ = open_session({TEE_LOGIN_PUBLIC, {}});
+}
+
+std::uint32_t fuzz_device::open_session(const TEE_Identity& client) {
   TEE_Param params[4] = {};
-  std::uint32_t origin = 0;
-  const TEE_Identity client = {TEE_LOGIN_PUBLIC, {}};
-  require(world_->open_session(ta_uuid, client, 0, params, session_, origin) == TEE_SUCCESS, "a session opens");
+  std::uint32_t session = 0, origin = 0;
+  require(world_->open_session(ta_uuid, client, 0, params, session, origin) == TEE_SUCCESS, "a session opens");
+  return session;
 }
 
 void fuzz_device::close() {
@@ -98,7 +102,14 @@ hosted_tee::accounting fuzz_device::holdings() const {
   return world_->account(ta_uuid);
 }
 
-reply fuzz_device::run(const command& what) {
+reply fuzz_device::run_as(const TEE_Identity& client, const command& what) {
+  const std::uint32_t session = open_session(client);
+  const reply answer = run_in(session, what);
+  world_->close_session(session);
+  return answer;
+}
+
+reply fuzz_device::run_in(std::uint32_t session, const command& what) {
   const std::uint32_t types = what.types.value_or(natural_types(what));
   const std::size_t request_size = what.request ? what.request->size() : 0;
   const std::uint32_t capacity = what.capacity.value_or(0);
@@ -119,7 +130,7 @@ reply fuzz_device::run(const command& what) {
   }
   reply answer;
   std::uint32_t origin = 0;
-  answer.result = world_->invoke(session_, what.id, types, params, origin);
+  answer.result = world_->invoke(session, what.id, types, params, origin);
   require(answer.result != TEE_ERROR_TARGET_DEAD, "no request makes the TA panic");
   answer.a = params[0].value.a;
   answer.b = params[0].value.b;

@@ -52,12 +52,18 @@ class fuzz_device {
   /// run carries a command out. Its buffers are blocks of exactly their size, so that the sanitizer sees every byte
   /// beyond them. What must hold whatever a client sends is checked here: no panic, a failure that shows, a length
   /// within the response.
-  reply run(const command& what);
+  reply run(const command& what) { return run_in(session_, what); }
+
+  /// run_as does the same in a session of another client, for the one command.
+  reply run_as(const TEE_Identity& client, const command& what);
 
   [[nodiscard]] hosted_tee::accounting holdings() const;
   [[nodiscard]] hosted_tee::secure_world& world() { return *world_; }
 
  private:
+  std::uint32_t open_session(const TEE_Identity& client);
+  reply run_in(std::uint32_t session, const command& what);
+
   std::shared_ptr<hosted_tee::secure_world> world_;
   std::uint32_t session_ = 0;
 };

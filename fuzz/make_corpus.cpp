@@ -1,6 +1,10 @@
 // Writes the seeds that the fuzzers start from: whole lives of keys and operations, parameter sets, signatures, keys.
 //
 // usage: make_corpus FOLDER      writes FOLDER/command_fuzzer/* and so on for each fuzzer
+#include <openssl/evp.h>
+#include <openssl/rsa.h>
+#include <openssl/x509.h>
+
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -9,6 +13,7 @@
 
 #include "fuzz/fuzz_steps.h"
 #include "fuzz/request_maker.h"
+#include "fuzz/soter_steps.h"
 #include "src/params/keymaster_defs.h"
 
 using namespace keymaster;
@@ -216,6 +221,154 @@ seeds key_data_seeds() {
   return all;
 }
 
+int number(soter_step which) {
+  return static_cast<int>(which);
+}
+int number(soter_key which) {
+  return static_cast<int>(which);
+}
+
+// The bytes behind a step are its choices, in the order in which soter_fuzzer.cpp asks for them.
+void export_statement(bytes& all, soter_key key) {
+  join(all, {number(soter_step::export_key), number(key), 0});
+}
+void touch(bytes& all, int client, int age) {
+  join(all, {number(soter_step::notify), client, 0, 7, 0, 0, 0, age, 0});
+}
+void begin_statement(bytes& all, soter_key key, int padding, int digest) {
+  join(all, {number(soter_step::begin), number(key), padding, digest});
+}
+void add_message(bytes& all, const std::string& text) {
+  join(all, {number(soter_step::update), 0, static_cast<int>(text.size())});
+  all.insert(all.end(), text.begin(), text.end());
+}
+void finish_statement(bytes& all) {
+  join(all, {number(soter_step::finish)});
+}
+
+/// With a service: its place, and where it responds the room for it.
+void load(bytes& all) {
+  join(all, {number(soter_step::service), 0});
+}
+
+seeds soter_seeds() {
+  bytes services, exports, signatures, growth, fingers, answers, counters;
+  load(services);
+  join(services, {number(soter_step::service), 1, number(soter_step::service), 2, 0xBD, 1, number(soter_step::service),
+                  3, 64, 0, number(soter_step::restart), number(soter_step::service), 3, 8, 0});
+  for (std::size_t key = 0; key < soter_key_count; ++key) export_statement(exports, static_cast<soter_key>(key));
+  join(exports, {number(soter_step::restart)});
+  export_statement(exports, soter_key::counted_by_attk);
+  for (int padding = 0; padding < 3; ++padding) {
+    begin_statement(signatures, soter_key::counted_by_attk, padding, 0);
+    add_message(signatures, "challenge \"1\"/");
+    add_message(signatures, "\xC3\xA9");
+    finish_statement(signatures);
+  }
+  begin_statement(growth, soter_key::by_attk, 0, 0);
+  for (int size = 0; size < 6; ++size) join(growth, {number(soter_step::update), 7, size});
+  finish_statement(growth);
+  touch(fingers, 0, 0);
+  load(fingers);
+  for (const int client : {0, 6, 7}) {
+    for (int age = 0; age < 6; ++age) touch(fingers, client, age);
+    begin_statement(fingers, soter_key::counted_by_key, 0, 0);
+    add_message(fingers, "x");
+    finish_statement(fingers);
+  }
+  join(fingers, {number(soter_step::advance_clock), 0xB9, 0x0B});
+  begin_statement(fingers, soter_key::counted_by_key, 0, 0);
+  finish_statement(fingers);
+  for (int answer = 0; answer < 8; ++answer) {
+    join(answers, {number(soter_step::change_key), answer, 0, answer, 1, 2, 3, number(soter_step::service), 1});
+    join(answers, {number(soter_step::change_property), 0, answer, 1, 2, 3, number(soter_step::service), 0});
+  }
+  for (int value = 0; value < 6; ++value) {
+    join(counters, {number(soter_step::store_counter), value, value % 5});
+    for (int use = 0; use < 3; ++use) export_statement(counters, soter_key::counted_by_key);
+  }
+  seeds all = {{"services", services}, {"exports", exports}, {"signatures", signatures}, {"growth", growth},
+               {"fingers", fingers},   {"answers", answers}, {"counters", counters}};
+  for (int after = 0; after < 12; ++after) {
+    bytes faults;
+    join(faults, {number(soter_step::order_fault), after * 8, after % 2, 0});
+    begin_statement(faults, soter_key::counted_by_attk, 0, 0);
+    join(faults, {number(soter_step::order_fault), after * 3, after % 2, 0});
+    add_message(faults, "x");
+    finish_statement(faults);
+    export_statement(faults, soter_key::counted_by_attk);
+    all.emplace_back("fault_" + std::to_string(after), faults);
+  }
+  return all;
+}
+
+/// No fault, the choices, then a box.
+seeds tlv_seeds() {
+  const bytes head = {0, 1, 2, 3, 4, 5, 6, 7, 8};
+  bytes inner = {7, 0, 4, 0, 77, 0, 0, 0}, box = head;
+  join(box, {0x35, 0x18, 7, 0, 's', 'e', 'n', 's', 'o', 'r', 0, 1, 0, 8, 0});
+  box.insert(box.end(), inner.begin(), inner.end());
+  join(box, {2, 0, 0, 0, 2, 0, 1, 0, 9});
+  bytes starved = box;
+  starved.front() = 37;
+  return {{"empty", head}, {"box", box}, {"starved", starved}};
+}
+
+/// A capacity, a count of members, then each: its name, its kind, no fault, its value.
+seeds json_seeds() {
+  bytes object = {200, 0, 5};
+  join(object, {1, 'a', 0, 0, 8, 'x', '/', 'y', '"', '\\', '\n', 0x01, 'z'});
+  join(object, {1, 'b', 4, 0, 0, 7, 0, 0, 0, 2, 'c', 'd', 4, 0, 2, 64, 0, 0, 0});
+  join(object, {1, 'e', 7, 0, 1, 1, 'f', 0, 0, 3, 0xE2, 0x82, 0xAC, 1, 'a', 4, 0, 1, 0, 0, 0, 0, 0, 0});
+  return {{"object", object}};
+}
+
+seeds utf8_seeds() {
+  seeds all;
+  for (const char* const text : {"plain", "\xC3\xA9\xE2\x82\xAC\xF0\x9F\x98\x80", "\xED\x9F\xBF\xEE\x80\x80",
+                                 "\xED\xA0\x80", "\xF4\x8F\xBF\xBF", "\xF4\x90\x80\x80", "\xC0\xAF"}) {
+    const std::string content = text;
+    all.emplace_back("text_" + std::to_string(all.size()), bytes(content.begin(), content.end()));
+  }
+  return all;
+}
+
+/// The public half of a key that is made for this, as a statement has it.
+std::string told_key() {
+  EVP_PKEY* const key = EVP_RSA_gen(2048);
+  unsigned char* der = nullptr;
+  const int size = i2d_PUBKEY(key, &der);
+  std::string base64(static_cast<std::size_t>(size + 2) / 3 * 4 + 1, '\0');
+  EVP_EncodeBlock(reinterpret_cast<unsigned char*>(base64.data()), der, size);
+  base64.pop_back();
+  OPENSSL_free(der);
+  EVP_PKEY_free(key);
+  std::string escaped;
+  for (const char character : base64) {
+    if (character == '/') escaped += '\\';
+    escaped += character;
+  }
+  return "-----BEGIN PUBLIC KEY-----\\n" + escaped + "\\n-----END PUBLIC KEY-----";
+}
+
+/// The way that the text goes, then the text: as it is, as one that a key states, as one that it signed.
+seeds statement_seeds() {
+  const std::string of_key = "{\"counter\":7,\"pub_key\":\"" + told_key() + "\"}";
+  const std::string of_message =
+      R"({"raw":"c","fid":5,"counter":9,"uid":4294967295,"tee_n":"a","tee_v":"b","fp_n":"c","fp_v":"d","cpu_id":"e\/f"})";
+  seeds all;
+  const auto add = [&](const std::string& name, std::uint8_t way, const std::string& text) {
+    bytes seed = {way};
+    seed.insert(seed.end(), text.begin(), text.end());
+    all.emplace_back(name, seed);
+  };
+  add("bare", 0, std::string("\x02\0\0\0{}", 6) + std::string(256, 'x'));
+  add("text", 1, of_message);
+  add("key", 2, of_key);
+  add("message", 3, of_message);
+  return all;
+}
+
 bool write(const std::filesystem::path& folder, const seeds& all) {
   std::filesystem::create_directories(folder);
   for (const auto& [name, content] : all) {
@@ -235,9 +388,14 @@ int main(int argc, char** argv) {
     return 2;
   }
   const std::filesystem::path folder = argv[1];
-  const bool written = fuzzing::write(folder / "command_fuzzer", fuzzing::command_seeds()) &&
-                       fuzzing::write(folder / "marshal_fuzzer", fuzzing::marshal_seeds()) &&
-                       fuzzing::write(folder / "signature_fuzzer", fuzzing::signature_seeds()) &&
-                       fuzzing::write(folder / "key_data_fuzzer", fuzzing::key_data_seeds());
+  const std::pair<const char*, fuzzing::seeds> corpora[] = {
+      {"command_fuzzer", fuzzing::command_seeds()},     {"marshal_fuzzer", fuzzing::marshal_seeds()},
+      {"signature_fuzzer", fuzzing::signature_seeds()}, {"key_data_fuzzer", fuzzing::key_data_seeds()},
+      {"soter_fuzzer", fuzzing::soter_seeds()},         {"tlv_fuzzer", fuzzing::tlv_seeds()},
+      {"json_fuzzer", fuzzing::json_seeds()},           {"utf8_fuzzer", fuzzing::utf8_seeds()},
+      {"statement_fuzzer", fuzzing::statement_seeds()},
+  };
+  bool written = true;
+  for (const auto& [name, seeds] : corpora) written = fuzzing::write(folder / name, seeds) && written;
   return written ? 0 : 1;
 }
