@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <poll.h>
 #include <termios.h>
 #include <unistd.h>
 
@@ -29,13 +30,21 @@ extern "C" void note_signal(int signal) {
   caught_signal = signal;
 }
 
-/// Signals that would end or stop the program while the terminal is silent are noted in place of that.
+/// Signals that would end or stop the program while the terminal is silent are noted in place of that. They are held
+/// back but for the time that wait_for_input waits: one that came just before it would otherwise be noted, and the
+/// waiting would not end.
 class deferred_signals {
  public:
   deferred_signals() {
     caught_signal = 0;
     struct sigaction noted {};
-    noted.sa_handler = note_signal;  // and no SA_RESTART: reading ends
+    noted.sa_handler = note_signal;
+    sigset_t held{};
+    (void)::sigemptyset(&held);
+    for (const int signal : signals) {
+      (void)::sigaddset(&held, signal);
+    }
+    (void)::pthread_sigmask(SIG_BLOCK, &held, &mask_before_);
     for (std::size_t i = 0; i < signals.size(); ++i) {
       (void)::sigaction(signals[i], nullptr, &before_[i]);
       if (before_[i].sa_handler != SIG_IGN) {
@@ -46,6 +55,7 @@ class deferred_signals {
   deferred_signals(const deferred_signals&) = delete;
   deferred_signals& operator=(const deferred_signals&) = delete;
   ~deferred_signals() {
+    (void)::pthread_sigmask(SIG_SETMASK, &mask_before_, nullptr);  // what was held back is noted now
     for (std::size_t i = 0; i < signals.size(); ++i) {
       (void)::sigaction(signals[i], &before_[i], nullptr);
     }
@@ -54,9 +64,16 @@ class deferred_signals {
     }
   }
 
+  /// wait_for_input waits until there is something to read. False: a signal ended the waiting.
+  [[nodiscard]] bool wait_for_input(int descriptor) const {
+    pollfd input{.fd = descriptor, .events = POLLIN, .revents = 0};
+    return ::ppoll(&input, 1, nullptr, &mask_before_) > 0;
+  }
+
  private:
   static constexpr std::array signals{SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGTSTP};
   std::array<struct sigaction, signals.size()> before_{};
+  sigset_t mask_before_{};
 };
 
 /// The controlling terminal.
@@ -94,13 +111,16 @@ class terminal {
     }
   }
 
-  secret_bytes read_line() {
+  secret_bytes read_line(const deferred_signals& signals) {
+    if (!signals.wait_for_input(descriptor_)) {
+      return {};
+    }
     secret_bytes line(line_limit);
     const ssize_t count = ::read(descriptor_, line.data(), line.size());
-    if (count < 0 && errno != EINTR) {
+    if (count < 0) {
       refuse_file("read", terminal_name, errno);
     }
-    line.resize(count < 0 ? 0 : static_cast<std::size_t>(count));
+    line.resize(static_cast<std::size_t>(count));
     return line;
   }
 
@@ -138,7 +158,7 @@ secret_bytes ask_password(const std::string& prompt) {
   terminal asked;
   asked.silence();
   asked.write(prompt);
-  secret_bytes password = asked.read_line();
+  secret_bytes password = asked.read_line(quietly);
   drop_line_ends(password);
   if (password.empty()) {
     throw failure_error("no password was given", "type it, or name a file with --password-file");
