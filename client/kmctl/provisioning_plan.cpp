@@ -62,12 +62,12 @@ void provisioning_plan::add_to(CLI::App& command) {
       ->type_name("TEXT")
       ->capture_default_str();
   command.add_option("--sensor-version", sensor_version_, "its version")->type_name("TEXT")->capture_default_str();
-  command.add_option("--cpu-id", cpu_id_, "the processor's serial number, 1 to 63 characters (default: drawn)")
-      ->type_name("TEXT");
-  command
-      .add_option("--device-id", device_id_text_,
-                  "the device's id, 16 to 32 bytes: hex:…, @FILE or text (default: drawn)")
-      ->type_name("VALUE");
+  cpu_id_option_ =
+      command.add_option("--cpu-id", cpu_id_, "the processor's serial number, 1 to 63 characters (default: drawn)");
+  cpu_id_option_->type_name("TEXT");
+  device_id_option_ = command.add_option("--device-id", device_id_text_,
+                                         "the device's id, 16 to 32 bytes: hex:…, @FILE or text (default: drawn)");
+  device_id_option_->type_name("VALUE");
 }
 
 std::vector<std::string> provisioning_plan::inputs() const {
@@ -79,13 +79,13 @@ std::vector<std::string> provisioning_plan::inputs() const {
 }
 
 void provisioning_plan::complete() {
-  if (cpu_id_.empty()) {
+  if (cpu_id_option_->empty()) {
     cpu_id_ = to_hex(draw(serial_number_size));
   }
   check_text("--cpu-id", cpu_id_, client::longest_cpu_id);
   check_text("--sensor-name", sensor_name_, longest_sensor_text);
   check_text("--sensor-version", sensor_version_, longest_sensor_text);
-  device_id_ = device_id_text_.empty() ? draw(client::longest_device_id) : read_device_id(device_id_text_);
+  device_id_ = device_id_option_->empty() ? draw(client::longest_device_id) : read_device_id(device_id_text_);
   refuse_shared_input({&key_file_, &passphrase_.file()});
   if (!key_file_.empty()) {
     key_ = read_key(key_file_, passphrase_);

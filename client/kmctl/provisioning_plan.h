@@ -42,6 +42,8 @@ class provisioning_plan {
   std::string sensor_version_ = "1";
   std::string cpu_id_;
   std::string device_id_text_;
+  CLI::Option* cpu_id_option_ = nullptr;  ///< tells an empty text, which is refused, from none
+  CLI::Option* device_id_option_ = nullptr;
 
   std::optional<keymaster::client::attestation_key> key_;
   keymaster::client::bytes device_id_;

@@ -128,7 +128,8 @@ class Provisioning(DeviceTest):
         self.assertIn(b"Provisioned", result.stderr)
 
     def test_texts_that_do_not_fit_are_refused_before_anything_is_asked(self):
-        for arguments in (["--cpu-id", "x" * 64], ["--cpu-id", "\u00e4"], ["--sensor-name", ""],
+        for arguments in (["--cpu-id", ""], ["--cpu-id", "x" * 64], ["--cpu-id", "\u00e4"], ["--device-id", ""],
+                          ["--sensor-name", ""],
                           ["--sensor-name", "x" * 64], ["--sensor-version", "a\nb"],
                           ["--device-id", "text:fifteen bytes.."[:20]],
                           ["--device-id", "hex:" + "00" * 33], ["--device-id", "hex:0g"],
