@@ -91,7 +91,8 @@ std::size_t tampered_file::read(std::span<std::uint8_t> buffer) {
     return filled;
   }
   tampered_ = true;
-  buffer[left_] = filled == 0 ? 0x21 : buffer[left_] ^ 1U;
+  std::uint8_t& byte = buffer[static_cast<std::size_t>(left_)];
+  byte = filled == 0 ? 0x21 : byte ^ 1U;
   return std::max<std::size_t>(filled, 1);
 }
 

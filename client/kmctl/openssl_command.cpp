@@ -73,6 +73,11 @@ int wait_for(pid_t child) {
   return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 
+[[noreturn]] void refuse(const std::string& command, int fault) {
+  throw failure_error(fmt::format("can't run {}: {}", command, std::generic_category().message(fault)),
+                      fmt::format("install {}", command));
+}
+
 std::string quoted(const std::string& word) {
   constexpr std::string_view plain = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_-./:=,+@%";
   if (!word.empty() && word.find_first_not_of(plain) == std::string::npos) {
@@ -105,11 +110,15 @@ command_result run_command(const std::vector<std::string>& words) {
   pid_t child = 0;
   const int fault = ::posix_spawnp(&child, arguments.front(), pipe.actions(), nullptr, arguments.data(), environ);
   if (fault != 0) {
-    throw failure_error(fmt::format("can't run {}: {}", words.front(), std::generic_category().message(fault)),
-                        fmt::format("install {}", words.front()));
+    refuse(words.front(), fault);
   }
   std::string output = pipe.read_all();
-  return {.status = wait_for(child), .output = std::move(output)};
+  const int status = wait_for(child);
+  // POSIX: where the caller cannot be told that there is nothing to run, the child ends like this.
+  if (status == 127) {
+    refuse(words.front(), ENOENT);
+  }
+  return {.status = status, .output = std::move(output)};
 }
 
 std::string command_line(const std::vector<std::string>& words) {

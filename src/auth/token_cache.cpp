@@ -52,7 +52,7 @@ cache_entry* choose_entry(const auth_token_fields& fresh) {
 }  // namespace
 
 TEE_Result token_cache_init() {
-  cache = reinterpret_cast<cache_entry*>(allocate_bytes(cache_size * sizeof(cache_entry)));
+  cache = allocate_records<cache_entry>(cache_size);
   if (cache == nullptr) {
     TRACE_ERROR("Out of memory");
     return TEE_ERROR_OUT_OF_MEMORY;

@@ -66,7 +66,7 @@ TEE_Time system_time() {
 }  // namespace
 
 TEE_Result use_log_init() {
-  use_log = reinterpret_cast<log_entry*>(allocate_bytes(log_size * sizeof(log_entry)));
+  use_log = allocate_records<log_entry>(log_size);
   if (use_log == nullptr) {
     TRACE_ERROR("Out of memory");
     return TEE_ERROR_OUT_OF_MEMORY;

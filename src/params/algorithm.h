@@ -28,14 +28,17 @@ using operation_constructor = keymaster_operation_t* (*)(const operation_request
 /// value untouched.
 using parameter_reader = int (*)(const keymaster_key_param_set_t& params, uint32_t* value);
 
+/// A list_writer writes the words of a list to memory of the client, which may lie at any address.
+using list_writer = void (*)(uint8_t* list);
+
 /// What an algorithm offers for one purpose.
 struct keymaster_purpose_ops {
   uint32_t (*get_support_block_mode_cnt)();
-  void (*get_support_block_mode)(uint32_t* block_modes);
+  list_writer get_support_block_mode;
   uint32_t (*get_support_padding_mode_cnt)();
-  void (*get_support_padding_mode)(uint32_t* paddings);
+  list_writer get_support_padding_mode;
   uint32_t (*get_support_digest_cnt)();
-  void (*get_support_digest)(uint32_t* digests);
+  list_writer get_support_digest;
 
   operation_constructor create_operation;
 
@@ -49,9 +52,9 @@ struct keymaster_algorithm_descriptor {
   const char* name;
   const keymaster_purpose_ops* (*get_purpose_ops)(uint32_t purpose);
   uint32_t (*get_support_import_format_cnt)();
-  void (*get_support_import_format)(uint32_t* formats);
+  list_writer get_support_import_format;
   uint32_t (*get_support_export_format_cnt)();
-  void (*get_support_export_format)(uint32_t* formats);
+  list_writer get_support_export_format;
 
   /// generate_key makes a key as `params` ask and adds to them what becomes known; key data and parameters go into the
   /// blob. On failure `key_data` is empty.
@@ -67,12 +70,11 @@ struct keymaster_algorithm_descriptor {
 };
 
 /// An algorithm's lists are constant arrays; constant_list makes the pair of entries that a descriptor holds for one.
-/// The array is copied bytewise: the output is client memory of any alignment.
 template <const auto& List>
 struct constant_list {
   static uint32_t count() { return static_cast<uint32_t>(List.size()); }
-  static void copy(uint32_t* values) {
-    if constexpr (List.size() != 0) std::memcpy(static_cast<void*>(values), List.data(), sizeof List);
+  static void copy(uint8_t* list) {
+    if constexpr (List.size() != 0) std::memcpy(list, List.data(), sizeof List);
   }
 };
 

@@ -38,9 +38,10 @@ struct keymaster_key_param_t {
   };
 };
 
-static_assert(sizeof(keymaster_key_param_t) == 24);
+static_assert(sizeof(keymaster_blob_t) == 16 && offsetof(keymaster_blob_t, data_length) == 8);
+static_assert(sizeof(keymaster_key_param_t) == 24 && alignof(keymaster_key_param_t) == 8);
 static_assert(offsetof(keymaster_key_param_t, enumerated) == 8);
-static_assert(offsetof(keymaster_key_param_t, blob) + offsetof(keymaster_blob_t, data_length) == 16);
+static_assert(offsetof(keymaster_key_param_t, blob) == 8);
 
 /// A counted array of parameters.
 struct keymaster_key_param_set_t {

@@ -6,6 +6,7 @@
 #include <cstring>
 #include <new>
 #include <span>
+#include <type_traits>
 #include <utility>
 
 #include "platform/wipe.h"
@@ -17,6 +18,14 @@ namespace keymaster {
 /// whether TEE_Malloc answers null for 0 bytes is the platform's choice, and null must only ever mean "out of memory".
 [[nodiscard]] inline uint8_t* allocate_bytes(uint32_t size) {
   return static_cast<uint8_t*>(TEE_Malloc(size == 0 ? 1 : size, TEE_MALLOC_FILL_ZERO));
+}
+
+/// allocate_records hands out `count` records of zero bytes, or null. TEE_Malloc aligns a block for any of them.
+template <class Record>
+[[nodiscard]] Record* allocate_records(uint32_t count) {
+  static_assert(std::is_trivial_v<Record>, "nothing constructs or destroys them");
+  void* const memory = allocate_bytes(count * sizeof(Record));
+  return static_cast<Record*>(memory);
 }
 
 /// basic_bytes owns one heap block of a fixed size. Empty: no block. Secret blocks are wiped before they are freed.

@@ -12,6 +12,8 @@ namespace {
 constinit uint32_t soter_fid = 0;
 constinit uint64_t soter_fid_time = 0;
 
+static_assert(sizeof(TEE_UUID) == 16);
+
 std::span<const uint8_t> uuid_bytes(const TEE_UUID& uuid) {
   return {reinterpret_cast<const uint8_t*>(&uuid), sizeof uuid};
 }

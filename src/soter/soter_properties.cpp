@@ -18,6 +18,7 @@ TEE_Result init_fp_uuid(const tlv_box* box, TEE_UUID* uuid) {
     TRACE_DEBUG("get fp uuid bytes ptr error");
     return TEE_ERROR_GENERIC;
   }
+  static_assert(sizeof *uuid == 16);
   if (length != sizeof *uuid) {
     TRACE_DEBUG("fp_uuid length unmatch expect %zu actual %d\n", sizeof *uuid, length);
     return TEE_ERROR_GENERIC;

@@ -11,7 +11,7 @@ namespace {
 /// A list that an algorithm offers: how many values, and how to get them. Either may be missing.
 struct offered_list {
   uint32_t (*count)() = nullptr;
-  void (*copy)(uint32_t* values) = nullptr;
+  list_writer copy = nullptr;
 };
 
 using purpose_list = offered_list (*)(const keymaster_purpose_ops& ops);
@@ -59,7 +59,7 @@ TEE_Result write_list(const offered_list& offered, keymaster_error_t missing, st
     return TEE_ERROR_BAD_PARAMETERS;
   }
   if (offered.copy == nullptr) return TEE_ERROR_GENERIC;
-  offered.copy(reinterpret_cast<uint32_t*>(list.data()));
+  offered.copy(list.data());
   return TEE_SUCCESS;
 }
 

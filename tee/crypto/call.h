@@ -57,7 +57,7 @@ class output {
     }
     return data_;
   }
-  void written(std::size_t count) const { *length_ = static_cast<std::uint32_t>(count); }
+  void written(std::uint64_t count) const { *length_ = static_cast<std::uint32_t>(count); }
 
   /// put copies all of `bytes`, or refuses as room does.
   void put(bytes_view bytes) const;

@@ -67,7 +67,7 @@ void persistent_object::write(std::span<const std::uint8_t> data) {
   if (end > object_store::max_object_size) throw call_failure(TEE_ERROR_STORAGE_NO_SPACE);
   if (data.empty()) return;
   secret_bytes all = content();
-  all.resize(std::max<std::size_t>(all.size(), end));
+  all.resize(std::max(all.size(), static_cast<std::size_t>(end)));
   std::copy(data.begin(), data.end(), all.begin() + position_);
   store_.write(key_, all);
   position_ = static_cast<std::uint32_t>(end);

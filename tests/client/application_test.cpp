@@ -3,8 +3,10 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <thread>
 #include <vector>
@@ -108,11 +110,22 @@ struct terminal {
       (void)::close(follower);
     }
   }
-  /// What the terminal shows so far.
-  [[nodiscard]] std::string shown() const {
-    std::array<char, 4096> text{};
-    const ssize_t count = ::read(leader, text.data(), text.size());
-    return {text.data(), count < 0 ? 0 : static_cast<std::size_t>(count)};
+  /// What is shown next, at most 4 KiB of it; nothing when that takes longer than 200 ms. A terminal hands on what was
+  /// written to it only a little later.
+  [[nodiscard]] std::string next() const {
+    std::array<char, 4096> piece{};
+    pollfd waiting{leader, POLLIN, 0};
+    const ssize_t count = ::poll(&waiting, 1, 200) > 0 ? ::read(leader, piece.data(), piece.size()) : 0;
+    return {piece.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0))};
+  }
+
+  /// All that was written by somebody who writes no more.
+  [[nodiscard]] std::string rest() const {
+    std::string text;
+    for (std::string piece = next(); !piece.empty(); piece = next()) {
+      text += piece;
+    }
+    return text;
   }
 };
 
@@ -148,10 +161,10 @@ TEST_F(ApplicationTest, ASpinnerTurnsAndGoesAway) {
     const spinner slow("Working");
     // It turns when the machine has time for it; reading waits for something to be shown.
     while (shown.find("Working /") == std::string::npos) {
-      shown += screen.shown();
+      shown += screen.next();
     }
   }
-  shown += screen.shown();
+  shown += screen.rest();
   EXPECT_EQ(shown.find("Quick"), std::string::npos);
   EXPECT_NE(shown.find("\r\x1b[KWorking |  0."), std::string::npos) << shown;
   EXPECT_NE(shown.find("Working /"), std::string::npos) << shown;

@@ -265,6 +265,7 @@ TEST(OpensslCommand, GivesStatusAndOutput) {
   EXPECT_EQ(done.output, "out\nerr\n");
   EXPECT_EQ(run_command({"sh", "-c", "kill -9 $$"}).status, 128 + 9);
   EXPECT_THROW((void)run_command({"/does/not/exist"}), failure_error);
+  EXPECT_THROW((void)run_command({"sh", "-c", "exit 127"}), failure_error) << "the same, told in another way";
 }
 
 }  // namespace

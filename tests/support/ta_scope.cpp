@@ -68,7 +68,8 @@ parameter_set in_ta(const param_list& list) {
   parameter_set set;
   const std::size_t count = list.params().size();
   if (count == 0) return set;
-  set.params = reinterpret_cast<keymaster_key_param_t*>(heap_copy(bytes(count * sizeof(keymaster_key_param_t))));
+  void* const records = heap_copy(bytes(count * sizeof(keymaster_key_param_t)));
+  set.params = static_cast<keymaster_key_param_t*>(records);
   for (const param& p : list.params()) {
     keymaster_key_param_t& record = set.params[set.length++];
     record.tag = p.tag;

@@ -126,8 +126,10 @@ TEST_F(ClientTest, MemoryThatCantBeIsRefusedByTheApiItself) {
   char byte = 0;
   first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) { return ADD_FAILURE(), TEE_SUCCESS; };
   operation.paramTypes = TEEC_MEMREF_TEMP_INPUT;
-  operation.params[0].tmpref = {&byte, std::size_t{1} << 32};
-  EXPECT_EQ(invoke(), TEEC_ERROR_EXCESS_DATA);
+  if constexpr (sizeof(std::size_t) > sizeof(std::uint32_t)) {  // elsewhere no size is too large to be told
+    operation.params[0].tmpref = {&byte, static_cast<std::size_t>(std::uint64_t{1} << 32)};
+    EXPECT_EQ(invoke(), TEEC_ERROR_EXCESS_DATA);
+  }
   operation.params[0].tmpref = {nullptr, 1};
   EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS);
   operation.paramTypes = TEEC_MEMREF_WHOLE;

@@ -112,7 +112,9 @@ TEST_F(GenerateTest, TheExponentIsTheOneAskedFor) {
     ASSERT_NE(key, nullptr);
     BIGNUM* e = nullptr;
     ASSERT_EQ(EVP_PKEY_get_bn_param(key.get(), "e", &e), 1);
-    EXPECT_EQ(BN_get_word(e), exponent);
+    bytes value(sizeof exponent);
+    EXPECT_EQ(BN_bn2lebinpad(e, value.data(), static_cast<int>(value.size())), 8);
+    EXPECT_EQ(value, u64(exponent));
     BN_free(e);
   }
 }

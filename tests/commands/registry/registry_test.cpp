@@ -35,9 +35,9 @@ uint32_t three() {
 uint32_t none() {
   return 0;
 }
-void copy_values(uint32_t* values) {
+void copy_values(uint8_t* values) {
   constexpr uint32_t all[] = {7, 8, 0x80000009};
-  std::memcpy(static_cast<void*>(values), all, sizeof all);
+  std::memcpy(values, all, sizeof all);
 }
 
 }  // namespace
@@ -173,7 +173,7 @@ TEST_F(RegistryTest, AnAlgorithmWithoutGenerationOrImportMakesNoKeys) {
 struct list_row {
   std::uint32_t count_command, list_command;
   uint32_t (**count)();
-  void (**copy)(uint32_t*);
+  list_writer* copy;
   const char* line;
   keymaster_error_t unsupported;
 };
