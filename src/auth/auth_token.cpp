@@ -14,6 +14,7 @@ namespace {
 constexpr uint32_t mac_size = 32;
 constexpr uint32_t mac_bits = mac_size * 8;
 constexpr uint32_t mac_offset = auth_token_size - mac_size;
+static_assert(mac_offset == 37);
 constexpr uint32_t boot_seed_size = 32;
 
 constinit TEE_ObjectHandle token_key = TEE_HANDLE_NULL;
@@ -39,25 +40,6 @@ TEE_Result compute_mac(TEE_ObjectHandle key, std::span<const uint8_t> message, s
     return r;
   }
   return TEE_SUCCESS;
-}
-
-/// Computes the MAC of `message` into `signature` and tells whether there is one. Without that answer a token of zero
-/// bytes would pass whenever the platform runs out of operations: the cleared signature equals it.
-bool compute_token_mac(std::span<uint8_t> signature, TEE_ObjectHandle key, std::span<const uint8_t> message) {
-  if (signature.size() != mac_size) {
-    std::fill(signature.begin(), signature.end(), uint8_t{0});
-    TRACE_ERROR("Wrong signature size, expected %dB, got %dB\n", mac_size, static_cast<uint32_t>(signature.size()));
-  }
-  wiped_array<256> mac;
-  uint32_t mac_length = 0;
-  if (compute_mac(key, message, mac.bytes, &mac_length) != TEE_SUCCESS) {
-    std::fill(signature.begin(), signature.end(), uint8_t{0});
-    return false;
-  }
-  if (mac_length != mac_size) TRACE_ERROR("Wrong MAC length, expected %dB, got %dB\n", mac_size, mac_length);
-  const std::size_t copied = std::min({signature.size(), std::size_t{mac_length}, sizeof mac.bytes});
-  std::copy_n(mac.bytes, copied, signature.begin());
-  return mac_length == mac_size && signature.size() == mac_size;
 }
 
 }  // namespace
@@ -98,9 +80,22 @@ void release_auth_token_key() {
   token_key = TEE_HANDLE_NULL;
 }
 
-void ComputeSignature(uint8_t* signature, uint32_t signature_length, TEE_ObjectHandle key, const uint8_t* message,
+bool ComputeSignature(uint8_t* signature, uint32_t signature_length, TEE_ObjectHandle key, const uint8_t* message,
                       uint32_t message_length) {
-  (void)compute_token_mac({signature, signature_length}, key, {message, message_length});
+  if (signature_length != mac_size) {
+    std::fill_n(signature, signature_length, uint8_t{0});
+    TRACE_ERROR("Wrong signature size, expected %dB, got %dB\n", mac_size, signature_length);
+  }
+  wiped_array<256> mac;
+  uint32_t mac_length = 0;
+  if (compute_mac(key, {message, message_length}, mac.bytes, &mac_length) != TEE_SUCCESS) {
+    std::fill_n(signature, signature_length, uint8_t{0});
+    return false;
+  }
+  if (mac_length != mac_size) TRACE_ERROR("Wrong MAC length, expected %dB, got %dB\n", mac_size, mac_length);
+  const uint32_t copied = std::min({signature_length, mac_length, static_cast<uint32_t>(sizeof mac.bytes)});
+  std::copy_n(mac.bytes, copied, signature);
+  return mac_length == mac_size && signature_length == mac_size;
 }
 
 int check_auth_token_valid(const uint8_t* token, uint32_t token_length) {
@@ -114,7 +109,7 @@ int check_auth_token_valid(const uint8_t* token, uint32_t token_length) {
   }
   wiped_array<mac_size> mac;
   const std::span<const uint8_t> bytes{token, token_length};
-  if (!compute_token_mac(mac.bytes, token_key, bytes.first(mac_offset))) return 1;
+  if (!ComputeSignature(mac.bytes, mac_size, token_key, bytes.data(), mac_offset)) return 1;
   return constant_time_equal(mac.bytes, bytes.subspan(mac_offset)) ? 0 : 1;
 }
 

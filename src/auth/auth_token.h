@@ -32,10 +32,11 @@ struct auth_token_fields {
 [[nodiscard]] TEE_Result init_auth_token_key();
 void release_auth_token_key();
 
-/// ComputeSignature writes the first bytes of HMAC-SHA256(`message`) under `key` to `signature`. It reports nothing: on
-/// a failure `signature` is all zero, which is why check_auth_token_valid does not decide by it.
-void ComputeSignature(uint8_t* signature, uint32_t signature_length, TEE_ObjectHandle key, const uint8_t* message,
-                      uint32_t message_length);
+/// ComputeSignature writes the first bytes of HMAC-SHA256(`message`) under `key` to `signature`, and tells whether that
+/// is the whole MAC. On a failure `signature` is all zero; without the answer a token whose MAC is zero bytes would
+/// pass whenever the platform runs out of operations.
+[[nodiscard]] bool ComputeSignature(uint8_t* signature, uint32_t signature_length, TEE_ObjectHandle key,
+                                    const uint8_t* message, uint32_t message_length);
 
 /// check_auth_token_valid answers 0 for a token of the right size and version whose MAC verifies, else 1.
 [[nodiscard]] int check_auth_token_valid(const uint8_t* token, uint32_t token_length);

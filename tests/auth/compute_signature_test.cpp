@@ -1,4 +1,4 @@
-// ComputeSignature reports nothing: what it leaves in its output is all that a caller gets.
+// What ComputeSignature leaves in its output, and what it says of it.
 #include <fmt/format.h>
 
 #include "platform/handles.h"
@@ -27,18 +27,21 @@ class ComputeSignatureTest : public TaUnitTest {
   bytes sign(std::uint32_t size, const bytes& message) {
     bytes signature(size, 0xEE);
     ta.clear_trace();
-    ComputeSignature(signature.data(), size, key.get(), message.data(), static_cast<std::uint32_t>(message.size()));
+    whole =
+        ComputeSignature(signature.data(), size, key.get(), message.data(), static_cast<std::uint32_t>(message.size()));
     return signature;
   }
 
   const bytes secret = pattern(32, 3);
   object_handle key;
+  bool whole = false;  // what it said of the last signature
 };
 
 TEST_F(ComputeSignatureTest, TheSignatureIsHmacSha256) {
   for (const std::size_t size : {0U, 1U, 37U, 64U, 1000U}) {
     const bytes message = pattern(size);
     EXPECT_EQ(sign(32, message), hmac_sha256(secret, message)) << size;
+    EXPECT_TRUE(whole);
     EXPECT_THAT(ta.errors(), IsEmpty());
   }
 }
@@ -49,6 +52,7 @@ TEST_F(ComputeSignatureTest, AnotherSizeIsToldAndServedAllTheSame) {
     bytes expected = mac;
     expected.resize(size);  // shorter: the first bytes; longer: zeros behind the MAC
     EXPECT_EQ(sign(size, message), expected) << size;
+    EXPECT_FALSE(whole);
     EXPECT_THAT(ta.errors(), ElementsAre(fmt::format("Wrong signature size, expected 32B, got {}B\n", size)));
   }
 }
@@ -64,6 +68,7 @@ TEST_F(ComputeSignatureTest, AFailureClearsTheWholeOutputAndGivesTheOperationBac
     const auto before = ta.holdings();
     ta.faults().fail_call(r.call, 1, TEE_ERROR_BUSY);
     EXPECT_EQ(sign(32, pattern(37)), bytes(32, 0)) << r.call;
+    EXPECT_FALSE(whole);
     EXPECT_THAT(ta.errors(), ElementsAre(r.line));
     ta.faults().fail_call(r.call, 1, TEE_ERROR_BUSY);
     EXPECT_EQ(sign(40, pattern(37)), bytes(40, 0)) << r.call;
@@ -76,10 +81,12 @@ TEST_F(ComputeSignatureTest, AMacOfAnotherLengthIsToldAndCopiedAsFarAsItGoes) {
   const bytes message = pattern(37), mac = hmac_sha256(secret, message);
   ta.faults().override_output("TEE_MACComputeFinal", 1, [](std::uint32_t* length, TEE_Result&) { *length = 20; });
   EXPECT_EQ(sign(32, message), join({bytes(mac.begin(), mac.begin() + 20), bytes(12, 0xEE)}));
+  EXPECT_FALSE(whole);
   EXPECT_THAT(ta.errors(), ElementsAre("Wrong MAC length, expected 32B, got 20B\n"));
 
   ta.faults().override_output("TEE_MACComputeFinal", 1, [](std::uint32_t* length, TEE_Result&) { *length = 64; });
   EXPECT_EQ(sign(32, message), mac);
+  EXPECT_FALSE(whole);
   EXPECT_THAT(ta.errors(), ElementsAre("Wrong MAC length, expected 32B, got 64B\n"));
 }
 
