@@ -41,6 +41,7 @@ void* instance_heap::take(std::uint32_t size, bool zero, std::uint64_t bytes_aft
   std::memset(block, zero ? 0 : fill_pattern, size);
   bytes_ = static_cast<std::uint32_t>(bytes_after);
   peak_ = std::max(peak_, bytes_);
+  span_peak_ = std::max(span_peak_, bytes_);
   return block;
 }
 

@@ -35,6 +35,10 @@ class instance_heap {
   [[nodiscard]] std::uint32_t bytes() const { return bytes_; }
   [[nodiscard]] std::uint32_t blocks() const { return static_cast<std::uint32_t>(blocks_.size()); }
   [[nodiscard]] std::uint32_t peak() const { return peak_; }
+
+  /// begin_span begins a stretch of time, such as a command; span_peak is the highest bytes() since then.
+  void begin_span() { span_peak_ = bytes_; }
+  [[nodiscard]] std::uint32_t span_peak() const { return span_peak_; }
   [[nodiscard]] std::uint32_t limit() const { return limit_; }
 
  private:
@@ -46,6 +50,7 @@ class instance_heap {
   std::uint32_t limit_;
   std::uint32_t bytes_ = 0;
   std::uint32_t peak_ = 0;
+  std::uint32_t span_peak_ = 0;
 };
 
 }  // namespace hosted_tee

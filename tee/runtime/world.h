@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "tee/runtime/device.h"
+#include "tee/runtime/heap_report.h"
 #include "tee/runtime/secure_world.h"
 #include "tee/runtime/state_folder.h"
 #include "tee/runtime/ta_instance.h"
@@ -71,6 +72,7 @@ class world final : public secure_world, private session_service {
   state_folder folder_;
   std::optional<std::uint32_t> heap_limit_;
   device_services device_;
+  heap_report heap_report_;
   instance_heap::inspector free_inspector_;
   std::vector<std::unique_ptr<ta_instance>> instances_;  // after device_: they end before it
   std::unordered_map<std::uint32_t, session_record> sessions_;

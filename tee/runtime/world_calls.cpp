@@ -97,9 +97,11 @@ bool world::run(ta_instance& ta, call& what) {
   ta.param_types = what.types;
   ta.params = what.params;
   ta.busy = true;
+  ta.heap.begin_span();
   const auto panicked = run_guarded([](void* context) { (*static_cast<call*>(context))(); }, &what);
   ta.busy = false;
   ta.params = nullptr;
+  if (what.kind == call::entry::invoke) heap_report_.note(ta.uuid, what.command, ta.heap.span_peak());
   return !panicked;
 }
 
