@@ -17,6 +17,15 @@ if(NOT KEYMASTER_SANITIZE)
   target_compile_options(keymaster_ta_options INTERFACE -Wframe-larger-than=1024)
 endif()
 
+# For the processor that the TA ships on, which is what its budgets are kept for: small, and without an access to memory
+# that is not aligned, as a device may trap it.
+string(COMPARE EQUAL "${CMAKE_SYSTEM_PROCESSOR}" armv7-a KEYMASTER_FOR_ARM)
+if(KEYMASTER_FOR_ARM)
+  # The last three of what -Os turns on cost GCC 12 half a kilobyte here.
+  target_compile_options(keymaster_ta_options INTERFACE -Os -mno-unaligned-access
+    -fno-expensive-optimizations -fno-move-loop-invariants -fno-schedule-insns2)
+endif()
+
 set(KEYMASTER_TA_FOLDER "${PROJECT_BINARY_DIR}/ta")
 
 # trusted_applications: the images of all TAs. What one TA finds beside it decides what it answers, so programs that run
@@ -34,6 +43,29 @@ function(add_trusted_application name uuid library)
   target_link_options(${name} PRIVATE -Wl,--gc-sections -Wl,-Bsymbolic -Wl,-z,now -Wl,-z,relro -Wl,--build-id=none)
   if(NOT KEYMASTER_SANITIZE)
     target_link_options(${name} PRIVATE -nostdlib)
+  endif()
+  if(KEYMASTER_FOR_ARM)
+    # The compiler's arithmetic helpers are the platform's: those of this tool chain raise a signal, which is Linux's.
+    set(script "${PROJECT_SOURCE_DIR}/cmake/trusted_application_arm.ld")
+    # The calls of the platform lie before the code: out of reach for the short form of the jumps to them.
+    target_link_options(${name} PRIVATE "-Wl,-T,${script}" -Wl,-z,max-page-size=4096 -Wl,--long-plt)
+    set_target_properties(${name} PROPERTIES LINK_DEPENDS "${script}")
+  elseif(NOT KEYMASTER_SANITIZE)
     target_link_libraries(${name} PRIVATE gcc)
   endif()
+endfunction()
+
+# add_trusted_application_object(NAME UUID LIBRARY): joins `LIBRARY` whole into the relocatable `<UUID>.o`, for a device
+# whose own SDK links its images. The sections stay apart, so that that link can drop what it does not need.
+function(add_trusted_application_object name uuid library)
+  set(object "${KEYMASTER_TA_FOLDER}/${uuid}.o")
+  add_custom_command(OUTPUT "${object}"
+    COMMAND "${CMAKE_COMMAND}" -E make_directory "${KEYMASTER_TA_FOLDER}"
+    COMMAND "${CMAKE_CXX_COMPILER}" -r -nostdlib -o "${object}"
+            -Wl,--whole-archive "$<TARGET_FILE:${library}>" -Wl,--no-whole-archive
+    DEPENDS ${library}
+    COMMENT "Joining ${uuid}.o"
+    VERBATIM)
+  add_custom_target(${name} ALL DEPENDS "${object}")
+  set_target_properties(${name} PROPERTIES TRUSTED_APPLICATION_OBJECT "${object}")
 endfunction()

@@ -18,6 +18,9 @@ test_packages=(
 # Without these the fuzzing step is skipped, and says so.
 fuzz_packages=(clang libclang-rt-14-dev)
 
+# For the preset `arm`, beside what tools/arm-sysroot unpacks into the build's own folder.
+arm_packages=(g++-arm-linux-gnueabihf qemu-user-static googletest)
+
 # Prints those of the named packages that are not installed, one a line.
 missing_packages() {
   local package
