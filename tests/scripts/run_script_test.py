@@ -26,7 +26,7 @@ case " $INSTALLED " in *" $package "*|*" everything "*) printf installed ;; *) e
 
 # The first configuration leaves this file behind.
 CMAKE = """
-case "$*" in *--preset\\ release\\ -D*) mkdir -p build/release && : >build/release/build.ninja ;; esac
+case "$*" in *--preset\\ *\\ -D*) mkdir -p "build/$2" && : >"build/$2/build.ninja" ;; esac
 """
 
 # The tools that the scripts take from the system: a PATH of these alone has no apt-get, sudo or network client.
@@ -53,6 +53,8 @@ class ScriptTest(unittest.TestCase):
         self.stand_in(self.programs / "apt-get")
         self.stand_in(self.programs / "id", "echo ${USER_ID:-0}")
         self.stand_in(self.tree / "build/release/client/kmctl/kmctl", "echo shown")
+        self.stand_in(self.tree / "build/arm/emulated/kmctl", "echo shown on ARM")
+        self.stand_in(self.tree / "tools/arm-sysroot")
 
     def stand_in(self, path, says=""):
         path.parent.mkdir(parents=True, exist_ok=True)
@@ -114,7 +116,7 @@ class RunScript(ScriptTest):
         for arguments, status in ((["--help"], 0), (["-h"], 0), (["a", "b"], 2)):
             result = self.start(self.tree / "run", *arguments)
             self.assertEqual(result.returncode, status)
-            self.assertTrue(result.stdout.startswith("usage: ./run [FILE]\n"))
+            self.assertTrue(result.stdout.startswith("usage: ./run [--arm] [FILE]\n"))
             self.assertEqual(self.calls.read_text(), "")
 
     def test_it_is_configured_once_and_built_each_time(self):
@@ -125,6 +127,19 @@ class RunScript(ScriptTest):
         self.demo()
         self.assertEqual(self.called("cmake"), ["cmake --build --preset release --target kmctl trusted_applications"])
         self.assertEqual(self.called("apt-get"), [])
+
+    def test_on_arm_it_takes_the_libraries_the_build_and_the_folder_of_arm(self):
+        result = self.start(self.tree / "run", "--arm")
+        self.assertEqual((result.returncode, result.stderr), (0, ""))
+        self.assertTrue(result.stdout.endswith("shown on ARM\n"))
+        self.assertEqual(len(self.called("arm-sysroot")), 1)
+        self.assertEqual(self.called("cmake"), [
+            "cmake --preset arm -DKEYMASTER_TESTS=OFF -DKEYMASTER_BENCH=OFF",
+            "cmake --build --preset arm --target kmctl trusted_applications"])
+        self.assertEqual(self.called("kmctl"), ["kmctl demo --force --output build/demo-arm -- README.md"])
+        (self.tree / "letter").write_text("Dear Mary")
+        self.start(self.tree / "run", "--arm", "letter")
+        self.assertEqual(self.called("kmctl"), ["kmctl demo --force --output build/demo-arm -- letter"])
 
     def test_a_failure_stops_it_and_is_shown(self):
         for failing in ("cmake", "kmctl"):

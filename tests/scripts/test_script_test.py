@@ -44,6 +44,7 @@ class TestScript(unittest.TestCase):
         self.benchmark = self.tree / "build/release/bench/keymaster_benchmark"
         self.stand_in(self.benchmark, "echo figures")
         self.stand_in(self.tree / "fuzz/run.sh")
+        self.stand_in(self.tree / "tools/arm-sysroot")
 
     def stand_in(self, path, says=""):
         path.parent.mkdir(parents=True, exist_ok=True)
@@ -67,6 +68,7 @@ class TestScript(unittest.TestCase):
             "passed  Fuzzing",
             "passed  Tests of release: 100% tests passed, 0 tests failed out of 3",
             "passed  Tests of asan: 100% tests passed, 0 tests failed out of 3",
+            "passed  Tests of arm, emulated: 100% tests passed, 0 tests failed out of 3",
             "skipped Published test vectors: KEYMASTER_VECTORS names no folder"])
 
     def test_a_failure_keeps_nothing_from_running(self):
@@ -75,7 +77,21 @@ class TestScript(unittest.TestCase):
             status, outcome = self.run_test(failing)
             self.assertEqual(status, 1)
             self.assertIn(line, outcome)
-            self.assertEqual(len(self.called("ctest")), 2)
+            self.assertEqual(len(self.called("ctest")), 3)
+
+    def test_libraries_for_arm_that_cannot_be_had_fail_the_run(self):
+        status, outcome = self.run_test("arm-sysroot")
+        self.assertEqual(status, 1)
+        self.assertEqual(outcome[4], "FAILED  Tests of arm, emulated")
+        self.assertEqual(len(self.called("ctest")), 2)
+
+    def test_a_compiler_for_arm_that_cannot_be_installed_fails_the_run(self):
+        self.stand_in(self.programs / "dpkg-query", 'case "$*" in *g++-arm*) exit 1 ;; esac; printf installed')
+        self.stand_in(self.programs / "apt-get", "exit 100")
+        self.stand_in(self.programs / "id", "echo 0")
+        status, outcome = self.run_test()
+        self.assertEqual(status, 1)
+        self.assertEqual(outcome[4], "FAILED  Tests of arm: its compiler and emulator cannot be installed here")
 
     def test_failed_tests_are_named(self):
         status, outcome = self.run_test("ctest-release")
