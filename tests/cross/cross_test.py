@@ -139,11 +139,12 @@ class Cross(unittest.TestCase):
         self.both[1].run("finger", "enrol", "1234567890")
         signed = self.path("sign.statement")
         for maker, taker, blob in self.ways({"attested": ["--soter", "--counted", "--uid", UID]}):
+            app = self.path(f"{maker.name}.pem")
             maker.run("export", "--statement", blob, "-o", self.path("key.statement"))
-            taker.run("statement", "verify", "--export", "--record", record, "--uid", UID, "--public-key-out",
-                      self.path("app.pem"), "--force", self.path("key.statement"))
+            taker.run("statement", "verify", "--export", "--record", record, "--uid", UID, "--public-key-out", app,
+                      self.path("key.statement"))
             taker.run("sign", "--statement", "--finger", "1", blob, challenge, "-o", signed)
-            asked = ["statement", "verify", "--sign", "--signer", self.path("app.pem"), "--finger", "1", "--uid", UID,
+            asked = ["statement", "verify", "--sign", "--signer", app, "--finger", "1", "--uid", UID,
                      "--record", record, "--challenge", "@" + challenge]
             told = maker.run(*asked, signed)
             self.assertIn(b"Accepted: the statement of a signed challenge", told)
