@@ -62,6 +62,17 @@ TEST_F(HeapReportTest, EachCommandHasTheMostThatWasInUseWhileItRan) {
                                       line(first_uuid, 255, charge(2040))));
 }
 
+TEST_F(HeapReportTest, ARunThatTookLessDoesNotHideOneThatTookMore) {
+  for (const std::uint32_t size : {8U, 800U, 16U}) {
+    first.invoke = [size](void*, std::uint32_t, std::uint32_t, TEE_Param*) {
+      TEE_Free(TEE_Malloc(size, 0));
+      return TEE_SUCCESS;
+    };
+    (void)invoke(must_open(first_ta::uuid), 1);
+  }
+  EXPECT_THAT(reported(), ElementsAre(line(first_uuid, 1, charge(800))));
+}
+
 TEST_F(HeapReportTest, WhatAnEarlierCommandKeepsCounts) {
   first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) {
     return TEE_Malloc(8, 0) != nullptr ? TEE_SUCCESS : TEE_ERROR_OUT_OF_MEMORY;
