@@ -6,8 +6,9 @@ SOURCES is a JSON file of the build: `documents` with tables between `<!-- measu
 `image` (the file `<uuid>.ta`), `stack` and `heap` (commands that print tables), and `reports` (the folder where the
 test programs of this build left what their commands took of the heap, see KEYMASTER_HEAP_REPORT).
 
-All tables but one must be exactly what is measured. The most heap over all tests depends on which of them ran, and some
-draw their input by chance: there the documents' figure is a ceiling, and at most twice what was seen.
+All tables but one must be exactly what is measured. The most heap over all tests depends on which of them ran, and on
+keys and signatures whose numbers are longer one time than another: there the documents' figure is a ceiling, and at most
+twice what was seen. Programs whose requests are a matter of chance report nothing.
 """
 import json
 import pathlib
@@ -21,6 +22,7 @@ from elf import Elf, parts
 
 LIMIT_OF_IMAGE, LIMIT_OF_STACK, LIMIT_OF_HEAP = 64 * 1024, 4 * 1024, 512 * 1024
 SUITE = "most heap over all tests"
+MARGIN = 512  # for numbers that are longer another time
 MARKED = re.compile(r"(<!-- measured: (?P<name>[^\n]+) -->\n)(?P<table>.*?)(<!-- end -->)", re.DOTALL)
 
 
@@ -66,7 +68,7 @@ class SuiteHeap:
     def table(self):
         lines = [row("command", f"most heap bytes, of {number(LIMIT_OF_HEAP)}"), "|---|---:|"]
         for command, shown in self.names.items():
-            size = -(-self.peaks[command] // 1024) * 1024
+            size = -(-(self.peaks[command] + MARGIN) // 1024) * 1024
             lines.append(row(f"`{shown}`", number(min(size, LIMIT_OF_HEAP))))
         return "\n".join(lines) + "\n"
 
