@@ -11,7 +11,9 @@ add_library(keymaster_options INTERFACE)
 target_compile_options(keymaster_options INTERFACE
   -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wcast-align -Wundef -Wvla -Werror
   $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor -Woverloaded-virtual -Wold-style-cast>
-  $<$<COMPILE_LANGUAGE:C>:-Wstrict-prototypes>)
+  $<$<COMPILE_LANGUAGE:C>:-Wstrict-prototypes>
+  # libcrypto's macros note the file of their caller; what is installed does not tell where it was built.
+  -fmacro-prefix-map=${PROJECT_SOURCE_DIR}/=)
 
 if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU" AND CMAKE_CXX_COMPILER_VERSION VERSION_LESS 13)
   # GCC 12 sees overlapping copies in every `"text" + std::string` that it inlines (GCC bug 105651).

@@ -26,7 +26,9 @@ if(KEYMASTER_FOR_ARM)
     -fno-expensive-optimizations -fno-move-loop-invariants -fno-schedule-insns2)
 endif()
 
+# Where the images of a build stand, and where installed ones stand below the folder of the hosted TEE's library.
 set(KEYMASTER_TA_FOLDER "${PROJECT_BINARY_DIR}/ta")
+set(KEYMASTER_TA_INSTALL_FOLDER keymaster/ta)
 
 # trusted_applications: the images of all TAs. What one TA finds beside it decides what it answers, so programs that run
 # TAs depend on them all.

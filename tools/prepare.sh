@@ -13,6 +13,7 @@ build_packages=(
 test_packages=(
   libgtest-dev libgmock-dev googletest libbenchmark-dev
   clang-format clang-tidy python3
+  man-db mandoc zsh fish lintian dpkg-dev file systemd
 )
 
 # Without these the fuzzing step is skipped, and says so.

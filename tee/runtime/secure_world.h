@@ -47,7 +47,7 @@ class world_error : public std::runtime_error {
 /// What a device is made of. Everything has a default; tests set what they need.
 struct world_options {
   std::filesystem::path state;        ///< state folder; made when missing (mode 0700)
-  std::filesystem::path ta_folder;    ///< where `<uuid>.ta` images lie; empty: KEYMASTER_TA_PATH, else the build's own
+  std::filesystem::path ta_folder;    ///< where `<uuid>.ta` images lie; empty: see default_ta_folders
   std::optional<bool> rpmb;           ///< whether the device has RPMB storage; default: its settings, else yes
   std::optional<TEE_UUID> device_id;  ///< default: its settings, else drawn once and kept in the state folder
   std::optional<std::array<std::uint8_t, 32>> boot_seed;  ///< default: drawn at every start

@@ -36,13 +36,25 @@ std::string path_of(const file_descriptor& fd) {
   return "/proc/self/fd/" + std::to_string(fd.get());
 }
 
+// The file that this library was loaded from, as the loader names it.
+const char* own_file() {
+  Dl_info self{};
+  return dladdr(reinterpret_cast<void*>(&tee_entry_open_session), &self) == 0 ? nullptr : self.dli_fname;
+}
+
+// The folder of that file, without links, whatever the loader's search path called it.
+std::filesystem::path own_folder() {
+  const char* file = own_file();
+  std::error_code lost;
+  return file == nullptr ? std::filesystem::path() : std::filesystem::canonical(file, lost).parent_path();
+}
+
 // An image takes the platform's calls from the program's global scope. A program that loaded this library as a plug-in
 // has it in a scope of its own until it is asked for again.
 void enter_global_scope() {
   static const bool entered = [] {
-    Dl_info self{};
-    if (dladdr(reinterpret_cast<void*>(&tee_entry_open_session), &self) == 0) return false;
-    return dlopen(self.dli_fname, RTLD_NOW | RTLD_NOLOAD | RTLD_GLOBAL) != nullptr;
+    const char* file = own_file();
+    return file != nullptr && dlopen(file, RTLD_NOW | RTLD_NOLOAD | RTLD_GLOBAL) != nullptr;
   }();
   (void)entered;  // what is missing shows when the image is bound
 }
@@ -142,9 +154,9 @@ std::unique_ptr<ta_image> find_ta(const TEE_UUID& ta, const std::vector<std::fil
 std::vector<std::filesystem::path> default_ta_folders() {
   const char* path = std::getenv("KEYMASTER_TA_PATH");
   if (path == nullptr || *path == '\0') {
-    std::error_code none;
-    const std::filesystem::path program = std::filesystem::read_symlink("/proc/self/exe", none);
-    return {program.parent_path().parent_path() / "lib" / "keymaster" / "ta", HOSTED_TEE_BUILD_TA_FOLDER};
+    const std::filesystem::path own = own_folder();
+    if (own.empty()) return {};  // a relative path would be one of the caller's current folder
+    return {own / HOSTED_TEE_TA_FOLDER};
   }
   std::vector<std::filesystem::path> folders;
   std::string_view rest = path;

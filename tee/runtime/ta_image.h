@@ -41,8 +41,8 @@ class ta_image {
 /// Throws std::runtime_error when what is there is not an image of that TA.
 [[nodiscard]] std::unique_ptr<ta_image> find_ta(const TEE_UUID& ta, const std::vector<std::filesystem::path>& folders);
 
-/// default_ta_folders: those of KEYMASTER_TA_PATH (separated by colons), else the installed one beside this program's
-/// folder and the build's own.
+/// default_ta_folders: those of KEYMASTER_TA_PATH (separated by colons), else `keymaster/ta` in the folder that this
+/// library was loaded from. So every program finds the images that belong to its library, wherever both were moved to.
 [[nodiscard]] std::vector<std::filesystem::path> default_ta_folders();
 
 }  // namespace hosted_tee

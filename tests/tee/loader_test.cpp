@@ -4,6 +4,7 @@
 #include <fstream>
 
 #include "tee/runtime/instance_heap.h"
+#include "tee/runtime/ta_image.h"
 #include "tee/runtime/uuid.h"
 #include "tests/tee/world_fixture.h"
 
@@ -99,6 +100,21 @@ TEST_F(LoaderTest, LooksThroughTheFoldersOfTheEnvironmentInOrder) {
   ::setenv("KEYMASTER_TA_PATH", folder.path().c_str(), 1);
   start();
   EXPECT_EQ(open(shared_ta).result, TEE_ERROR_ITEM_NOT_FOUND);
+  ::setenv("KEYMASTER_TA_PATH", before.c_str(), 1);
+}
+
+TEST_F(LoaderTest, LooksBesideItsOwnLibraryAndNowhereElseWhenTheEnvironmentNamesNoFolder) {
+  const char* old = std::getenv("KEYMASTER_TA_PATH");
+  const std::string before = old == nullptr ? "" : old;
+  for (const char* none : {"", static_cast<const char*>(nullptr)}) {
+    ::unsetenv("KEYMASTER_TA_PATH");
+    if (none != nullptr) ::setenv("KEYMASTER_TA_PATH", none, 1);
+    const std::vector<fs::path> folders = default_ta_folders();
+    ASSERT_EQ(folders.size(), 1U);
+    EXPECT_TRUE(folders.front().is_absolute());
+    EXPECT_THAT(folders.front().string(), ::testing::EndsWith("/keymaster/ta"));
+    EXPECT_TRUE(fs::is_regular_file(folders.front() / "fbacea43-f475-4df3-866f-76256aba994f.ta"));
+  }
   ::setenv("KEYMASTER_TA_PATH", before.c_str(), 1);
 }
 
