@@ -34,19 +34,24 @@ temporary_folder::~temporary_folder() {
   std::filesystem::remove_all(path_, ignored);
 }
 
-bench_device::bench_device() : own_folder_(std::in_place), state_(own_folder_->path() / "state") {
-  start();
+bench_device::bench_device() : own_folder_(std::in_place) {
+  start(own_folder_->path() / "state");
 }
 
-bench_device::bench_device(std::filesystem::path state) : state_(std::move(state)) {
-  start();
+bench_device::bench_device(std::filesystem::path state) {
+  start(state);
 }
 
-void bench_device::start() {
+bench_device::bench_device(std::string context_name) : context_name_(std::move(context_name)) {
+  open();
+}
+
+void bench_device::start(const std::filesystem::path& state) {
   hosted_tee::world_options options;
-  options.state = state_;
+  options.state = state;
   options.kept_trace = hosted_tee::trace_level::error;  // as for every client
   world_ = hosted_tee::secure_world::open_shared(options);
+  context_name_ = "embedded:" + state.string();
   open();
 }
 
@@ -56,8 +61,7 @@ bench_device::~bench_device() {
 }
 
 void bench_device::open() {
-  const std::string name = "embedded:" + state_.string();
-  must(TEEC_InitializeContext(name.c_str(), &context_) == TEEC_SUCCESS, "no connection to the TEE");
+  must(TEEC_InitializeContext(context_name_.c_str(), &context_) == TEEC_SUCCESS, "no connection to the TEE");
   must(TEEC_OpenSession(&context_, &session_, &teec_uuid, TEEC_LOGIN_PUBLIC, nullptr, nullptr, nullptr) == TEEC_SUCCESS,
        "no session to the TA");
 }

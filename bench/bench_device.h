@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <memory>
 #include <optional>
+#include <string>
 
 #include "bench/wire.h"
 #include "tee/runtime/secure_world.h"
@@ -36,15 +37,19 @@ class temporary_folder {
   std::filesystem::path path_;
 };
 
-/// A device in a state folder: a given one, which stays, or one of its own. What fails throws std::runtime_error.
+/// A device in a state folder (a given one, which stays, or one of its own), or behind a server. What fails throws
+/// std::runtime_error.
 class bench_device {
  public:
   bench_device();
   explicit bench_device(std::filesystem::path state);
+  explicit bench_device(std::string context_name);  ///< behind a server: it has no world() and no accounting() here
   bench_device(const bench_device&) = delete;
   bench_device& operator=(const bench_device&) = delete;
   ~bench_device();
 
+  [[nodiscard]] TEEC_Context& context() { return context_; }
+  [[nodiscard]] TEEC_Session& session() { return session_; }
   [[nodiscard]] hosted_tee::secure_world& world() { return *world_; }
   [[nodiscard]] hosted_tee::accounting accounting() const;
 
@@ -64,13 +69,12 @@ class bench_device {
   bytes import_key(const bytes& params, const bytes& material);
 
  private:
+  void start(const std::filesystem::path& state);
   void open();
   void close();
 
-  void start();
-
   std::optional<temporary_folder> own_folder_;
-  std::filesystem::path state_;
+  std::string context_name_;
   std::shared_ptr<hosted_tee::secure_world> world_;
   TEEC_Context context_ = {};
   TEEC_Session session_ = {};

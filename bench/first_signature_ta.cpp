@@ -11,7 +11,7 @@
 
 int main(int argc, char** argv) {
   if (argc != 3) return 2;
-  bench::bench_device device(argv[1]);
+  bench::bench_device device{std::filesystem::path(argv[1])};
   bench::ta_operation signing(device, {keymaster::KM_PURPOSE_SIGN, bench::read_blocks(argv[2]).at(0),
                                        bench::p256_sign_params(), bench::first_message()});
   const bench::bytes& signature = signing.run();

@@ -16,6 +16,8 @@ namespace bench {
 struct contest {
   double target = 0;
   int rounds = 1;
+  const char* first = "ta_us";  // what the times of the two ways are called
+  const char* second = "libcrypto_us";
 };
 
 /// time_rounds answers the seconds of one round.
@@ -32,23 +34,23 @@ inline double median(std::vector<double>& times) {
   return *middle;
 }
 
-/// run_side_by_side runs the TA's way and libcrypto's, and reports the ratio of their rates: 1 would be a TA that costs
-/// nothing. Medians, so that an interrupted round does not count.
-template <class Ta, class Libcrypto>
-void run_side_by_side(benchmark::State& state, const contest& terms, Ta ta, Libcrypto libcrypto) {
-  std::vector<double> ta_times, libcrypto_times;
-  bool ta_first = false;
+/// run_side_by_side runs the TA's way and libcrypto's, or two others, and reports the ratio of their rates: 1 would be
+/// a TA that costs nothing. Medians, so that an interrupted round does not count.
+template <class First, class Second>
+void run_side_by_side(benchmark::State& state, const contest& terms, First first, Second second) {
+  std::vector<double> first_times, second_times;
+  bool first_begins = false;
   for ([[maybe_unused]] auto _ : state) {
-    ta_first = !ta_first;
-    if (ta_first) ta_times.push_back(time_rounds(ta, terms.rounds));
-    libcrypto_times.push_back(time_rounds(libcrypto, terms.rounds));
-    if (!ta_first) ta_times.push_back(time_rounds(ta, terms.rounds));
-    state.SetIterationTime(ta_times.back());
+    first_begins = !first_begins;
+    if (first_begins) first_times.push_back(time_rounds(first, terms.rounds));
+    second_times.push_back(time_rounds(second, terms.rounds));
+    if (!first_begins) first_times.push_back(time_rounds(first, terms.rounds));
+    state.SetIterationTime(first_times.back());
   }
-  const double ta_median = median(ta_times), libcrypto_median = median(libcrypto_times);
-  state.counters["ta_us"] = ta_median * 1e6;
-  state.counters["libcrypto_us"] = libcrypto_median * 1e6;
-  state.counters["ratio"] = libcrypto_median / ta_median;
+  const double first_median = median(first_times), second_median = median(second_times);
+  state.counters[terms.first] = first_median * 1e6;
+  state.counters[terms.second] = second_median * 1e6;
+  state.counters["ratio"] = second_median / first_median;
   if (terms.target != 0) state.counters["target"] = terms.target;
 }
 

@@ -11,10 +11,12 @@
 #include <string>
 #include <utility>
 
+#include "fuzz/frame_kinds.h"
 #include "fuzz/fuzz_steps.h"
 #include "fuzz/request_maker.h"
 #include "fuzz/soter_steps.h"
 #include "src/params/keymaster_defs.h"
+#include "tee/remote/messages.h"
 
 using namespace keymaster;
 
@@ -369,6 +371,41 @@ seeds statement_seeds() {
   return all;
 }
 
+/// The kind of body, a choice of what the TA does, and the body.
+template <class Message>
+bytes frame_seed(frame_kinds kind, const Message& message) {
+  bytes seed(2 + hosted_tee::remote::frame_limit);
+  seed[0] = static_cast<std::uint8_t>(kind);
+  hosted_tee::remote::frame_writer out(std::span(seed).subspan(2));
+  write_body(out, message);
+  seed.resize(2 + out.size());
+  return seed;
+}
+
+seeds frame_seeds() {
+  namespace remote = hosted_tee::remote;
+  const bytes data = {1, 2, 3};
+  remote::request_slots request{0x7653, {}};
+  request.slots[1] = {0, 0, remote::memory_source::carried, 3, 0, 0, data};
+  request.slots[2] = {0, 0, remote::memory_source::carried, 16, 0, 0, {}};
+  request.slots[3] = {0, 0, remote::memory_source::shared, 64, 1, 128, {}};
+  remote::answer_slots answer{0x7653, {}};
+  answer.slots[2] = {0, 0, 3, data};
+  remote::status_answer status;
+  status.version = "1.0";
+  status.instances.resize(1);
+  remote::log_answer log;
+  log.lines = {{7, 1, 20, "TA", "function", "text"}};
+  return {{"invoke_request", frame_seed(frame_kinds::invoke_request, remote::invoke_request{1, 2, request})},
+          {"invoke_answer", frame_seed(frame_kinds::invoke_answer, remote::invoke_answer{{}, answer})},
+          {"open_request", frame_seed(frame_kinds::open_request, remote::open_request{{}, 1, 2, request})},
+          {"open_answer", frame_seed(frame_kinds::open_answer, remote::open_answer{{}, 1, answer})},
+          {"hello_answer", frame_seed(frame_kinds::hello_answer, remote::hello_answer{})},
+          {"share_request", frame_seed(frame_kinds::share_request, remote::share_request{4096, 3})},
+          {"status_answer", frame_seed(frame_kinds::status_answer, status)},
+          {"log_answer", frame_seed(frame_kinds::log_answer, log)}};
+}
+
 bool write(const std::filesystem::path& folder, const seeds& all) {
   std::filesystem::create_directories(folder);
   for (const auto& [name, content] : all) {
@@ -393,7 +430,7 @@ int main(int argc, char** argv) {
       {"signature_fuzzer", fuzzing::signature_seeds()}, {"key_data_fuzzer", fuzzing::key_data_seeds()},
       {"soter_fuzzer", fuzzing::soter_seeds()},         {"tlv_fuzzer", fuzzing::tlv_seeds()},
       {"json_fuzzer", fuzzing::json_seeds()},           {"utf8_fuzzer", fuzzing::utf8_seeds()},
-      {"statement_fuzzer", fuzzing::statement_seeds()},
+      {"statement_fuzzer", fuzzing::statement_seeds()}, {"frame_fuzzer", fuzzing::frame_seeds()},
   };
   bool written = true;
   for (const auto& [name, seeds] : corpora) written = fuzzing::write(folder / name, seeds) && written;

@@ -33,6 +33,7 @@ constexpr std::array command_rows = std::to_array<command_row>({
     {"finger", "Enrol fingers, and touch the sensor", define_finger},
     {"auth", "Enrol passwords, and turn them into auth tokens", define_auth},
     {"statement", "Check what devices state of their keys", define_statement},
+    {"tee", "Look at a server of the TEE, and end it", define_tee},
     {"demo", "Show on a file of yours what the system does", define_demo},
 });
 
@@ -54,7 +55,8 @@ constexpr const char* environment_help =
     "  KEYMASTER_TA_PATH  the folder of the TA images\n";
 
 void add_global_options(CLI::App& app, context& ctx) {
-  auto* const tee = app.add_option("--tee", ctx.tee, "the TEE to use, e.g. embedded:FOLDER")->type_name("NAME");
+  auto* const tee =
+      app.add_option("--tee", ctx.tee, "the TEE to use: embedded:FOLDER, or unix:PATH for a server")->type_name("NAME");
   app.add_option("--state", ctx.state, "folder of the device's state; a blob opens only with the state that sealed it")
       ->type_name("FOLDER")
       ->excludes(tee);

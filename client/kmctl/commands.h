@@ -31,6 +31,7 @@ void define_attest(CLI::App& group, context& ctx);
 void define_finger(CLI::App& group, context& ctx);
 void define_auth(CLI::App& group, context& ctx);
 void define_statement(CLI::App& group, context& ctx);
+void define_tee(CLI::App& group, context& ctx);
 
 /// A sub-command: its name, what it does in a few words, and the function that defines it.
 struct command_row {

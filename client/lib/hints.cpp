@@ -25,6 +25,7 @@ constexpr std::string_view look_at_the_trace =
 constexpr std::string_view no_companion =
     "the TEE has no image of this TA: build it, or point KEYMASTER_TA_PATH at the folder of the .ta files";
 constexpr std::string_view device_is_locked = "the device is locked: its key and its properties stay as they are";
+constexpr std::string_view management_is_denied = "the server answers this to its own user and to root alone";
 constexpr std::string_view no_such_finger = "no finger has this id: kmctl finger list shows those that are enrolled";
 constexpr std::string_view wrong_password =
     "the password is wrong, or the handle is not one of this user on this device; after five failures in a row there "
@@ -40,7 +41,16 @@ struct tee_advice {
 };
 
 constexpr std::array tee_advices = std::to_array<tee_advice>({
-    {"connect", TEEC_ERROR_BUSY, "another process uses this TEE: wait for it to end, or choose another state folder"},
+    {"connect", TEEC_ERROR_BUSY,
+     "another process uses this TEE: wait for it to end, or choose another state folder; or its server has as many "
+     "clients as it takes"},
+    {"connect", TEEC_ERROR_COMMUNICATION,
+     "no server answers at this socket: start one (teed --state FOLDER --socket PATH), or look at the path"},
+    {"connect", TEEC_ERROR_ACCESS_DENIED, "you may not connect to this socket: look at its file's permissions"},
+    {"connect", TEEC_ERROR_NOT_SUPPORTED, "client and server are of different versions"},
+    {"tee_status", TEEC_ERROR_ACCESS_DENIED, management_is_denied},
+    {"tee_log", TEEC_ERROR_ACCESS_DENIED, management_is_denied},
+    {"tee_stop", TEEC_ERROR_ACCESS_DENIED, management_is_denied},
     {"connect", TEEC_ERROR_BAD_STATE,
      "a newer version wrote the state: use that version, or choose another state folder"},
     {"connect", TEEC_ERROR_SECURITY,

@@ -1,16 +1,17 @@
 #include "tee/client/connection.h"
 
 #include <array>
-#include <cstdlib>
+#include <string>
 #include <string_view>
 #include <utility>
 
+#include "tee/client/client_failure.h"
 #include "tee/client/default_folder.h"
+#include "tee/client/embedded_link.h"
+#include "tee/client/remote_link.h"
 
 namespace hosted_tee {
 namespace {
-
-constexpr std::string_view embedded = "embedded:";
 
 constexpr std::array<std::pair<world_fault, TEEC_Result>, 6> fault_results{{
     {world_fault::busy, TEEC_ERROR_BUSY},
@@ -21,31 +22,41 @@ constexpr std::array<std::pair<world_fault, TEEC_Result>, 6> fault_results{{
     {world_fault::io, TEEC_ERROR_GENERIC},
 }};
 
-// An empty variable counts as none.
-const char* environment(const char* variable) {
-  const char* value = std::getenv(variable);
-  return value == nullptr || *value == '\0' ? nullptr : value;
+// A way in by the front of its names, and how the rest of a name is followed.
+struct way_in {
+  std::string_view prefix;
+  std::shared_ptr<tee_link> (*follow)(const std::string& rest);
+};
+
+std::shared_ptr<tee_link> embed(const std::string& folder) {
+  world_options options;
+  options.state = folder;
+  options.kept_trace = trace_level::error;
+  return std::make_shared<embedded_link>(secure_world::open_shared(options));
 }
 
-std::filesystem::path state_folder_of(const char* name) {
-  if (name == nullptr) name = environment("KEYMASTER_TEE");
-  if (name == nullptr) {
-    const auto folder = default_state_folder();
-    if (!folder) throw client_failure(TEEC_ERROR_GENERIC);
-    return *folder;
-  }
-  const std::string_view text = name;
-  if (!text.starts_with(embedded) || text.size() == embedded.size()) throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
-  return text.substr(embedded.size());
+std::shared_ptr<tee_link> call_server(const std::string& path) {
+  return std::make_shared<remote_link>(path);
 }
+
+constexpr std::array<way_in, 2> ways_in{{{"embedded:", embed}, {"unix:", call_server}}};
 
 }  // namespace
 
-std::shared_ptr<secure_world> connect(const char* name) {
-  world_options options;
-  options.state = state_folder_of(name);
-  options.kept_trace = trace_level::error;
-  return secure_world::open_shared(options);
+std::shared_ptr<tee_link> connect(const char* name) {
+  if (name == nullptr) name = environment_variable("KEYMASTER_TEE");
+  if (name == nullptr) {
+    const auto folder = default_state_folder();
+    if (!folder) throw client_failure(TEEC_ERROR_GENERIC);
+    return embed(folder->string());
+  }
+  const std::string_view text = name;
+  for (const way_in& way : ways_in) {
+    if (text.starts_with(way.prefix) && text.size() > way.prefix.size()) {
+      return way.follow(std::string(text.substr(way.prefix.size())));
+    }
+  }
+  throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
 }
 
 TEEC_Result result_of(world_fault fault) {

@@ -8,14 +8,8 @@
 namespace hosted_tee {
 namespace {
 
-// An empty variable counts as none.
-const char* environment(const char* variable) {
-  const char* value = std::getenv(variable);
-  return value == nullptr || *value == '\0' ? nullptr : value;
-}
-
 std::optional<std::filesystem::path> home_folder() {
-  if (const char* home = environment("HOME")) return home;
+  if (const char* home = environment_variable("HOME")) return home;
   const passwd* user = ::getpwuid(::geteuid());
   if (user == nullptr || user->pw_dir == nullptr) return std::nullopt;
   return user->pw_dir;
@@ -23,10 +17,15 @@ std::optional<std::filesystem::path> home_folder() {
 
 }  // namespace
 
+const char* environment_variable(const char* name) {
+  const char* const value = std::getenv(name);
+  return value == nullptr || *value == '\0' ? nullptr : value;
+}
+
 std::optional<std::filesystem::path> default_state_folder() {
-  if (const char* folder = environment("KEYMASTER_STATE")) return folder;
+  if (const char* folder = environment_variable("KEYMASTER_STATE")) return folder;
   // The XDG Base Directory rules have a relative path ignored.
-  const char* const states = environment("XDG_STATE_HOME");
+  const char* const states = environment_variable("XDG_STATE_HOME");
   if (states != nullptr && std::filesystem::path(states).is_absolute()) {
     return std::filesystem::path(states) / "keymaster";
   }

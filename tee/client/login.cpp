@@ -3,33 +3,15 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <cstring>
 #include <filesystem>
 #include <string>
 #include <vector>
 
-#include "tee/client/connection.h"
-#include "tee/runtime/uuid.h"
+#include "tee/client/client_failure.h"
 
 namespace hosted_tee {
 namespace {
-
-struct login_method {
-  std::uint32_t number;
-  bool user;
-  bool group;
-  bool application;
-};
-
-constexpr std::array<login_method, 6> methods{{
-    {TEEC_LOGIN_PUBLIC, false, false, false},
-    {TEEC_LOGIN_USER, true, false, false},
-    {TEEC_LOGIN_GROUP, false, true, false},
-    {TEEC_LOGIN_APPLICATION, false, false, true},
-    {TEEC_LOGIN_USER_APPLICATION, true, false, true},
-    {TEEC_LOGIN_GROUP_APPLICATION, false, true, true},
-}};
 
 bool is_member_of(gid_t group) {
   if (group == ::getegid()) return true;
@@ -49,17 +31,19 @@ std::uint32_t chosen_group(const void* connection_data) {
 
 }  // namespace
 
+login_method checked_login_method(std::uint32_t method, const void* connection_data) {
+  const auto known = find_login_method(method);
+  if (!known || (connection_data != nullptr) != known->group) throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
+  return *known;
+}
+
 TEE_Identity login_identity(std::uint32_t method, const void* connection_data) {
-  const auto* const found =
-      std::find_if(methods.begin(), methods.end(), [&](const login_method& m) { return m.number == method; });
-  if (found == methods.end() || (connection_data != nullptr) != found->group) {
-    throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
-  }
-  std::string name;
-  if (found->user) name += "uid=" + std::to_string(::geteuid()) + ";";
-  if (found->group) name += "gid=" + std::to_string(chosen_group(connection_data)) + ";";
-  if (found->application) name += "application=" + std::filesystem::read_symlink("/proc/self/exe").string() + ";";
-  return {method, name.empty() ? TEE_UUID{} : named_uuid(name)};
+  const login_method known = checked_login_method(method, connection_data);
+  client_facts self;
+  self.user = ::geteuid();
+  if (known.group) self.group = chosen_group(connection_data);
+  if (known.application) self.application = std::filesystem::read_symlink("/proc/self/exe").string();
+  return identity_of(known, self);
 }
 
 }  // namespace hosted_tee

@@ -2,7 +2,8 @@
 
 #include <limits>
 
-#include "tee/client/connection.h"
+#include "tee/client/client_failure.h"
+#include "tee/client/tee_link.h"
 
 namespace hosted_tee {
 namespace {
@@ -37,6 +38,12 @@ TEE_Param memory(void* buffer, std::size_t size) {
   return slot;
 }
 
+const shared_block& block_of(const TEEC_RegisteredMemoryReference& reference, const tee_link& link) {
+  const auto& block = *static_cast<const shared_block*>(reference.parent->imp.block);
+  if (block.owner().get() != &link) bad_parameters();
+  return block;
+}
+
 const TEEC_SharedMemory& shared_memory(const TEEC_RegisteredMemoryReference& reference) {
   const TEEC_SharedMemory* parent = reference.parent;
   if (parent == nullptr || parent->imp.context == nullptr) bad_parameters();
@@ -58,7 +65,7 @@ TEE_Param part(const TEEC_RegisteredMemoryReference& reference, std::uint32_t ty
 
 }  // namespace
 
-client_params::client_params(TEEC_Operation* operation) : operation_(operation) {
+client_params::client_params(TEEC_Operation* operation, const tee_link& link) : operation_(operation) {
   if (operation_ == nullptr) return;
   if (operation_->paramTypes > 0xFFFF) bad_parameters();
   for (unsigned i = 0; i < 4; ++i) {
@@ -72,6 +79,7 @@ client_params::client_params(TEEC_Operation* operation) : operation_(operation) 
       slots_[i] = memory(given.tmpref.buffer, given.tmpref.size);
     } else if (is_registered(type)) {
       slots_[i] = part(given.memref, type);
+      blocks_[i] = &block_of(given.memref, link);
       slot_type = type == TEEC_MEMREF_WHOLE ? whole_type(given.memref) : memref | (type & directions);
     } else if (type != TEEC_NONE) {
       bad_parameters();

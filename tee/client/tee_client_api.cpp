@@ -1,15 +1,14 @@
-// Contexts, sessions and commands of the Client API 1.0 (4.5), embedded form.
+// Contexts, sessions and commands of the Client API 1.0 (4.5).
 #include "tee_client_api.h"
 
 #include <cstring>
-#include <new>
 
+#include "tee/client/call.h"
 #include "tee/client/connection.h"
 #include "tee/client/login.h"
 #include "tee/client/parameters.h"
 
 namespace hosted_tee {
-namespace {
 
 // A result alone does not tell which file is at fault. A device that does not start has no trace, so the line goes
 // where KEYMASTER_TRACE has a device's lines printed.
@@ -21,49 +20,18 @@ void report(const std::exception& error) noexcept {
   }
 }
 
-// The one place where this library's exceptions become results.
-template <class Body>
-TEEC_Result client_call(Body&& body) noexcept {
-  try {
-    return body();
-  } catch (const client_failure& failure) {
-    return failure.code();
-  } catch (const world_error& error) {
-    report(error);
-    return result_of(error.fault());
-  } catch (const std::bad_alloc&) {
-    return TEEC_ERROR_OUT_OF_MEMORY;
-  } catch (const std::exception& error) {
-    report(error);
-    return TEEC_ERROR_GENERIC;
-  }
-}
+namespace {
 
 client_context& context_of(const TEEC_Context* context) {
   if (context == nullptr || context->imp == nullptr) throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
   return *static_cast<client_context*>(context->imp);
 }
 
-client_session& session_of(const TEEC_Session* session) {
+// By value: should the client close the session meanwhile, the call does not end in freed memory.
+client_session session_of(const TEEC_Session* session) {
   if (session == nullptr || session->imp == nullptr) throw client_failure(TEEC_ERROR_BAD_PARAMETERS);
   return *static_cast<client_session*>(session->imp);
 }
-
-// Where a result comes from, for a client that wants to know; the API itself until the TEE was asked.
-class origin_report {
- public:
-  explicit origin_report(std::uint32_t* out) : out_(out) {}
-  ~origin_report() {
-    if (out_ != nullptr) *out_ = value;
-  }
-  origin_report(const origin_report&) = delete;
-  origin_report& operator=(const origin_report&) = delete;
-
-  std::uint32_t value = TEEC_ORIGIN_API;
-
- private:
-  std::uint32_t* out_;
-};
 
 TEE_UUID to_tee(const TEEC_UUID& uuid) {
   static_assert(sizeof(TEE_UUID) == sizeof(TEEC_UUID));
@@ -77,7 +45,7 @@ TEE_UUID to_tee(const TEEC_UUID& uuid) {
 extern "C" {
 
 TEEC_Result TEEC_InitializeContext(const char* name, TEEC_Context* context) {
-  return client_call([&]() -> TEEC_Result {
+  return client_call(nullptr, [&]() -> TEEC_Result {
     if (context == nullptr) return TEEC_ERROR_BAD_PARAMETERS;
     context->imp = nullptr;
     context->imp = new client_context{connect(name)};
@@ -95,14 +63,14 @@ TEEC_Result TEEC_OpenSession(TEEC_Context* context, TEEC_Session* session, const
                              uint32_t connectionMethod, const void* connectionData, TEEC_Operation* operation,
                              uint32_t* returnOrigin) {
   origin_report origin(returnOrigin);
-  return client_call([&]() -> TEEC_Result {
+  return client_call(&origin, [&]() -> TEEC_Result {
     if (session == nullptr || destination == nullptr) return TEEC_ERROR_BAD_PARAMETERS;
     session->imp = nullptr;
-    auto opened = std::make_unique<client_session>(client_session{context_of(context).world, 0});
-    const TEE_Identity client = login_identity(connectionMethod, connectionData);
-    client_params params(operation);
-    const TEE_Result result = opened->world->open_session(to_tee(*destination), client, params.types(), params.slots(),
-                                                          opened->number, origin.value);
+    auto opened = std::make_unique<client_session>(client_session{context_of(context).tee, 0});
+    (void)checked_login_method(connectionMethod, connectionData);
+    client_params params(operation, *opened->tee);
+    const TEEC_Result result = opened->tee->open_session(to_tee(*destination), connectionMethod, connectionData, params,
+                                                         opened->number, origin.value);
     params.hand_back();
     if (result == TEE_SUCCESS) session->imp = opened.release();
     return result;
@@ -113,8 +81,8 @@ void TEEC_CloseSession(TEEC_Session* session) {
   if (session == nullptr || session->imp == nullptr) return;
   const std::unique_ptr<client_session> closed(static_cast<client_session*>(session->imp));
   session->imp = nullptr;
-  (void)client_call([&]() -> TEEC_Result {
-    closed->world->close_session(closed->number);
+  (void)client_call(nullptr, [&]() -> TEEC_Result {
+    closed->tee->close_session(closed->number);
     return TEEC_SUCCESS;
   });
 }
@@ -122,10 +90,10 @@ void TEEC_CloseSession(TEEC_Session* session) {
 TEEC_Result TEEC_InvokeCommand(TEEC_Session* session, uint32_t commandID, TEEC_Operation* operation,
                                uint32_t* returnOrigin) {
   origin_report origin(returnOrigin);
-  return client_call([&]() -> TEEC_Result {
-    const client_session& open = session_of(session);
-    client_params params(operation);
-    const TEE_Result result = open.world->invoke(open.number, commandID, params.types(), params.slots(), origin.value);
+  return client_call(&origin, [&]() -> TEEC_Result {
+    const client_session open = session_of(session);
+    client_params params(operation, *open.tee);
+    const TEEC_Result result = open.tee->invoke(open.number, commandID, params, origin.value);
     params.hand_back();
     return result;
   });

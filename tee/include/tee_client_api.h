@@ -37,7 +37,7 @@ typedef struct {
   uint32_t flags;
   struct {
     void* context;
-    void* allocated;
+    void* block;
   } imp;
 } TEEC_SharedMemory;
 
@@ -128,12 +128,15 @@ typedef struct {
 #define TEEC_LOGIN_GROUP_APPLICATION 0x00000006u
 
 /// TEEC_InitializeContext connects to a TEE. `name` chooses the way in: "embedded:FOLDER" runs the hosted TEE on that
-/// state folder inside the calling process; NULL takes the name in the environment variable KEYMASTER_TEE, or the
-/// default state folder. TEEC_ERROR_BAD_PARAMETERS for another form, and for a folder that holds something else than a
-/// device's state, TEEC_ERROR_BUSY when another process holds the folder, TEEC_ERROR_BAD_STATE when a newer version
-/// wrote it, TEEC_ERROR_BAD_FORMAT when one of its text files (`settings`, for one) can't be parsed,
-/// TEEC_ERROR_SECURITY when its content does not authenticate, TEEC_ERROR_GENERIC when it can't be used for another
-/// reason. KEYMASTER_TRACE has the reason printed.
+/// state folder inside the calling process; "unix:PATH" reaches the server that listens at PATH; NULL takes the name in
+/// the environment variable KEYMASTER_TEE, or the default state folder. TEEC_ERROR_BAD_PARAMETERS for another form, and
+/// for a folder that holds something else than a device's state, TEEC_ERROR_BUSY when another process holds the folder,
+/// TEEC_ERROR_BAD_STATE when a newer version wrote it, TEEC_ERROR_BAD_FORMAT when one of its text files (`settings`,
+/// for one) can't be parsed, TEEC_ERROR_SECURITY when its content does not authenticate, TEEC_ERROR_GENERIC when it
+/// can't be used for another reason. Of a server: TEEC_ERROR_BAD_PARAMETERS for a path that no socket can have,
+/// TEEC_ERROR_COMMUNICATION when nobody serves it, TEEC_ERROR_ACCESS_DENIED when its permissions forbid it,
+/// TEEC_ERROR_BUSY when it takes no more connections, TEEC_ERROR_NOT_SUPPORTED when it speaks another version of the
+/// wire. KEYMASTER_TRACE has the reason printed.
 TEEC_Result TEEC_InitializeContext(const char* name, TEEC_Context* context);
 void TEEC_FinalizeContext(TEEC_Context* context);
 

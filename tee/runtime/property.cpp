@@ -17,7 +17,7 @@ constexpr std::uint32_t protected_by_ree = 100;  // a protection level: the norm
 
 constexpr std::array<std::pair<std::string_view, std::string_view>, 6> texts{{
     {"gpd.tee.apiversion", "1.1"},
-    {"gpd.tee.description", "Hosted TEE for development and tests: a library in the caller's process"},
+    {"gpd.tee.description", "Hosted TEE for development and tests, no security boundary"},
     {"gpd.tee.trustedos.manufacturer", "Keymaster TA project"},
     {"gpd.tee.trustedos.implementation.version", HOSTED_TEE_VERSION},
     {"gpd.tee.firmware.manufacturer", "none"},

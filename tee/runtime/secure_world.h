@@ -1,7 +1,7 @@
 // The hosted secure world: TA instances, their sessions, and the device around them.
 //
 // One secure_world is one device: a state folder, a device identity, clocks, storage, and the TA instances that run on
-// it. It is a development and test runtime and not a security boundary: it lives in the caller's process.
+// it. It is a development and test runtime and not a security boundary: it lives in the process that opens it.
 #ifndef TEE_RUNTIME_SECURE_WORLD_H_
 #define TEE_RUNTIME_SECURE_WORLD_H_
 
@@ -14,6 +14,7 @@
 #include <span>
 #include <stdexcept>
 #include <string>
+#include <vector>
 
 #include "tee/runtime/accounting.h"
 #include "tee/runtime/builtin_ta.h"
@@ -59,6 +60,29 @@ struct world_options {
 
   /// As fault_plan::at_storage_step, from the very first step on; empty: none.
   std::function<void(std::string_view step)> at_storage_step;
+};
+
+/// One live instance of a TA.
+struct instance_status {
+  TEE_UUID ta;
+  std::uint32_t sessions = 0;
+  std::uint32_t heap_limit = 0;
+  accounting held;
+};
+
+/// A device at one moment, between two commands.
+struct world_status {
+  std::uint32_t sessions = 0;     ///< of clients, and of TAs with each other; those of dead instances too
+  std::uint64_t commands = 0;     ///< since the device started
+  std::uint64_t trace_total = 0;  ///< lines that the trace has held since then
+  std::uint32_t trace_kept = 0;   ///< lines that it holds
+  std::vector<instance_status> instances;
+};
+
+/// A line of the trace with its number: the device's first line has number 0.
+struct numbered_line {
+  std::uint64_t number;
+  trace_line line;
 };
 
 /// One device. Calls are serialised: one command at a time in the secure world, whichever thread asks; a TA that calls
@@ -107,6 +131,11 @@ class secure_world {
 
   /// account tells what the TA's live instance holds; all zero when it has none.
   [[nodiscard]] virtual accounting account(const TEE_UUID& ta) const = 0;
+
+  /// status and trace_lines wait for the running command, like every command does, and may be called whenever one may.
+  /// trace_lines gives up to `limit` lines, from number `from` on or from the oldest that is held.
+  [[nodiscard]] virtual world_status status() const = 0;
+  [[nodiscard]] virtual std::vector<numbered_line> trace_lines(std::uint64_t from, std::size_t limit) const = 0;
 
   /// has_instance tells whether the TA has a live instance (one that did not panic).
   [[nodiscard]] virtual bool has_instance(const TEE_UUID& ta) const = 0;

@@ -5,6 +5,7 @@
 //   device     the device's identity and its storage key, drawn once
 //   settings   optional, written by a person: `name = value` lines
 //   private.db, rpmb.db, rpmb.counter   persistent objects
+//   teed.sock, teed.sock.lock           the socket of a server that was told no other place, and its lock
 #ifndef TEE_RUNTIME_STATE_FOLDER_H_
 #define TEE_RUNTIME_STATE_FOLDER_H_
 

@@ -71,6 +71,7 @@ trace_line trace_log::next_line() {
 
 void trace_log::keep(trace_line&& line) {
   lines_.push_back(std::move(line));
+  ++total_;
   if (sink_ && lines_.back().level <= sink_level_) sink_(lines_.back());
 }
 

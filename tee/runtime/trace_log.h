@@ -4,6 +4,7 @@
 
 #include <cstdarg>
 #include <cstddef>
+#include <cstdint>
 #include <deque>
 #include <functional>
 #include <string>
@@ -45,6 +46,9 @@ class trace_log {
   void clear() { lines_.clear(); }
   [[nodiscard]] const std::deque<trace_line>& lines() const { return lines_; }
 
+  /// total is how many lines there ever were; the latest of those that are held has the number total() - 1.
+  [[nodiscard]] std::uint64_t total() const { return total_; }
+
   /// contains tells whether a line of `level` has exactly this text (format newline included).
   [[nodiscard]] bool contains(std::string_view text, trace_level level) const;
   [[nodiscard]] std::size_t count(std::string_view text, trace_level level) const;
@@ -60,6 +64,7 @@ class trace_log {
   }
 
   std::deque<trace_line> lines_;
+  std::uint64_t total_ = 0;
   std::function<void(const trace_line&)> sink_;
   trace_level sink_level_ = trace_level::error;
   trace_level kept_level_ = trace_level::debug;

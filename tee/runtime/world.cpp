@@ -46,6 +46,16 @@ object_key key_of(const TEE_UUID& ta, std::string_view id) {
   return {to_bytes(ta), std::string(id)};
 }
 
+void add_holdings(const instance& live, accounting& sum) {
+  sum.heap_bytes += live.heap.bytes();
+  sum.heap_blocks += live.heap.blocks();
+  sum.heap_peak += live.heap.peak();
+  for (const auto& [handle, item] : live.objects) {
+    ++(item->is_persistent() ? sum.persistent_objects : sum.transient_objects);
+  }
+  sum.operations += static_cast<std::uint32_t>(live.operations.size());
+}
+
 }  // namespace
 
 world::world(const world_options& options)
@@ -88,16 +98,37 @@ accounting world::account(const TEE_UUID& ta) const {
   const std::scoped_lock lock(mutex_);
   accounting sum;
   for (const auto& live : instances_) {
-    if (!same_uuid(live->uuid, ta)) continue;
-    sum.heap_bytes += live->heap.bytes();
-    sum.heap_blocks += live->heap.blocks();
-    sum.heap_peak += live->heap.peak();
-    for (const auto& [handle, item] : live->objects) {
-      ++(item->is_persistent() ? sum.persistent_objects : sum.transient_objects);
-    }
-    sum.operations += static_cast<std::uint32_t>(live->operations.size());
+    if (same_uuid(live->uuid, ta)) add_holdings(*live, sum);
   }
   return sum;
+}
+
+world_status world::status() const {
+  const std::scoped_lock lock(mutex_);
+  world_status now;
+  now.sessions = static_cast<std::uint32_t>(sessions_.size());
+  now.commands = commands_;
+  now.trace_total = device_.trace.total();
+  now.trace_kept = static_cast<std::uint32_t>(device_.trace.lines().size());
+  for (const auto& live : instances_) {
+    instance_status& entry = now.instances.emplace_back();
+    entry.ta = live->uuid;
+    entry.sessions = live->open_sessions;
+    entry.heap_limit = live->heap.limit();
+    add_holdings(*live, entry.held);
+  }
+  return now;
+}
+
+std::vector<numbered_line> world::trace_lines(std::uint64_t from, std::size_t limit) const {
+  const std::scoped_lock lock(mutex_);
+  const auto& lines = device_.trace.lines();
+  const std::uint64_t oldest = device_.trace.total() - lines.size();
+  std::vector<numbered_line> out;
+  for (std::uint64_t number = std::max(from, oldest); number < device_.trace.total() && out.size() < limit; ++number) {
+    out.push_back({number, lines[static_cast<std::size_t>(number - oldest)]});
+  }
+  return out;
 }
 
 bool world::has_instance(const TEE_UUID& ta) const {

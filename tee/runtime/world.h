@@ -38,6 +38,8 @@ class world final : public secure_world, private session_service {
   std::array<std::uint8_t, 32> boot_seed() const override { return device_.boot_seed; }
   bool has_rpmb() const override;
   accounting account(const TEE_UUID& ta) const override;
+  world_status status() const override;
+  std::vector<numbered_line> trace_lines(std::uint64_t from, std::size_t limit) const override;
   bool has_instance(const TEE_UUID& ta) const override;
   void set_free_inspector(std::function<void(std::span<const std::uint8_t>)> inspector) override;
   std::optional<std::string> read_object(const TEE_UUID& ta, std::uint32_t storage, std::string_view id) override;
@@ -78,6 +80,7 @@ class world final : public secure_world, private session_service {
   std::unordered_map<std::uint32_t, session_record> sessions_;
   std::vector<std::uint32_t> waiting_to_close_;  // sessions of a TA that was busy when their owner let go of them
   std::uint32_t last_session_ = 0;
+  std::uint64_t commands_ = 0;
 };
 
 }  // namespace hosted_tee

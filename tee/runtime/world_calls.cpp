@@ -234,6 +234,7 @@ TEE_Result world::open_session(const TEE_UUID& ta, const TEE_Identity& client, s
 TEE_Result world::invoke(std::uint32_t session, std::uint32_t command, std::uint32_t param_types, TEE_Param params[4],
                          std::uint32_t& origin) {
   const std::scoped_lock lock(mutex_);
+  ++commands_;
   const TEE_Result result = invoke_nested(session, command, param_types, params, origin);
   close_waiting();
   return result;

@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
 """The tour of README.md is real: every command in it is run, and prints what stands there.
 
-usage: tour_test.py README KMCTL
+usage: tour_test.py README KMCTL TEED
 
 A command is a line that begins with "$ ", with the lines that a backslash continues. What follows up to the next one is
 its output; a line "..." stands for any lines. Times and source lines may differ.
@@ -45,11 +45,11 @@ def agree(documented, printed):
     return re.fullmatch(pattern, "".join(normal(line) + "\n" for line in printed)) is not None
 
 
-def run(steps, kmctl, folder):
+def run(steps, programs, folder):
     """What each command prints, standard error included, in one shell that goes through the whole tour."""
     environment = {name: value for name, value in os.environ.items() if not name.startswith("KEYMASTER_")
                    or name == "KEYMASTER_TA_PATH"}
-    environment["PATH"] = f"{kmctl.parent}:{environment['PATH']}"
+    environment["PATH"] = ":".join([*(str(program.parent) for program in programs), environment["PATH"]])
     script = "".join(f"{command}\necho '{END}'\n" for command, _ in steps)
     done = subprocess.run(["bash"], input=script, cwd=folder, env=environment, text=True, check=False,
                           stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
@@ -57,10 +57,10 @@ def run(steps, kmctl, folder):
 
 
 def main():
-    readme, kmctl = pathlib.Path(sys.argv[1]), pathlib.Path(sys.argv[2]).resolve()
+    readme, *programs = (pathlib.Path(argument).resolve() for argument in sys.argv[1:])
     steps = steps_of(readme.read_text(encoding="utf-8"))
     with tempfile.TemporaryDirectory() as folder:
-        outputs = run(steps, kmctl, folder)
+        outputs = run(steps, programs, folder)
     faults = 0 if steps and len(outputs) == len(steps) else 1
     for (command, documented), printed in zip(steps, outputs):
         if not agree(documented, printed):

@@ -5,7 +5,9 @@ usage: installed_files_test.py SOURCE BUILD
 """
 import pathlib
 import re
+import subprocess
 import sys
+import time
 
 import install_case
 from install_case import InstalledTest, run
@@ -33,6 +35,19 @@ class InstalledFiles(InstalledTest):
         self.assertIn("Generated EC-256 key", told.stdout)
         state = run(self.prefix / "bin/kmctl", "--tee", self.tee, "device", "status")  # the provisioning TA's
         self.assertIn("locked", state.stdout)
+
+    def test_the_server_serves_wherever_the_tree_was_moved_to(self):
+        place = self.folder / "tee.sock"
+        server = subprocess.Popen([self.prefix / "bin/teed", "--state", self.folder / "state", "--socket", place])
+        self.addCleanup(server.kill)
+        while not place.exists():
+            self.assertIsNone(server.poll(), "the server has ended")
+            time.sleep(0.01)
+        told = run(self.prefix / "bin/kmctl", "--tee", f"unix:{place}", "generate", "--algorithm", "ec",
+                   self.folder / "key.blob")
+        self.assertIn("Generated EC-256 key", told.stdout)
+        run(self.prefix / "bin/kmctl", "--tee", f"unix:{place}", "tee", "stop")
+        self.assertEqual(server.wait(), 0)
 
     def test_the_images_are_those_beside_the_library_and_no_others(self):
         images = next(self.prefix.glob("lib*/**/ta"))

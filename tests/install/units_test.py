@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
 """The units of teed are sound, their sandbox is as tight as the documents say, and the hosted TEE runs in it.
 
-usage: units_test.py SOURCE KMCTL
+usage: units_test.py SOURCE KMCTL TEED
 """
 import ctypes
 import os
@@ -35,7 +35,7 @@ def kernel_can_refuse():
 
 
 class Units(unittest.TestCase):
-    source = kmctl = None
+    source = kmctl = teed = None
 
     def setUp(self):
         folder = tempfile.TemporaryDirectory(prefix="keymaster-units-")
@@ -58,6 +58,15 @@ class Units(unittest.TestCase):
         told = self.analyze("verify", "--man=no", self.folder / "teed.socket", self.folder / "teed.service")
         self.assertEqual((told.returncode, told.stdout), (0, ""))
 
+    def test_whatever_names_the_socket_names_the_one_of_the_unit(self):
+        place = re.search(r"^ListenSequentialPacket=(.*)$", (self.folder / "teed.socket").read_text(encoding="utf-8"),
+                          re.MULTILINE).group(1)
+        named = set()
+        for file in (*self.source.glob("docs/*.md"), *self.source.glob("packaging/man/*"),
+                     *self.source.glob("client/kmctl/*.cpp"), self.source / "README.md"):
+            named.update(re.findall(r"/run/keymaster/[\w.]*\w", file.read_text(encoding="utf-8")))
+        self.assertEqual(named, {place})
+
     @unittest.skipIf(shutil.which("systemd-analyze") is None, "systemd is not installed")
     def test_the_exposure_is_what_the_document_says(self):
         told = self.analyze("security", "--offline=true", "--threshold=10", self.folder / "teed.service")
@@ -65,6 +74,17 @@ class Units(unittest.TestCase):
         score = SCORE.search(told.stdout).group(1)
         document = (self.source / "docs/installing.md").read_text(encoding="utf-8")
         self.assertEqual(re.findall(r"exposure level of \*\*(\d+\.\d+)\*\*", document), [score], told.stdout)
+
+    def test_clients_cannot_share_so_much_that_the_service_is_killed_for_it(self):
+        service = (self.folder / "teed.service").read_text(encoding="utf-8")
+        command = re.search(r"^ExecStart=(.*)$", service, re.MULTILINE).group(1)
+        self.assertNotIn("--max-", command, "the usual limits are what counts below")
+        allowed = int(re.search(r"^MemoryMax=(\d+)G$", service, re.MULTILINE).group(1)) * 1024
+        told = " ".join(subprocess.run([self.teed, "--help"], text=True, check=True, stdout=subprocess.PIPE).stdout.split())
+        shared = re.search(r"--max-memory \S+ [^()]*all together have four times as much \(default: (\d+)\)", told)
+        connections = re.search(r"--max-connections \S+ [^()]*\(default: (\d+)\)", told)
+        used = 4 * int(shared.group(1)) + int(connections.group(1)) // 2  # a connection costs less than 512 KiB
+        self.assertLessEqual(used + 256, allowed)  # and the program with its trusted applications
 
     @unittest.skipIf(not kernel_can_refuse(), "the kernel has no PR_SET_MDWE")
     def test_images_are_loaded_where_no_memory_may_become_executable(self):
@@ -79,7 +99,7 @@ class Units(unittest.TestCase):
 
 
 if __name__ == "__main__":
-    if len(sys.argv) < 3:
+    if len(sys.argv) < 4:
         sys.exit(__doc__)
-    Units.source, Units.kmctl = pathlib.Path(sys.argv[1]), sys.argv[2]
-    unittest.main(argv=[sys.argv[0], *sys.argv[3:]], verbosity=1)
+    Units.source, Units.kmctl, Units.teed = pathlib.Path(sys.argv[1]), sys.argv[2], sys.argv[3]
+    unittest.main(argv=[sys.argv[0], *sys.argv[4:]], verbosity=1)

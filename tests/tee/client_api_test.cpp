@@ -11,7 +11,7 @@
 #include "tee/client/default_folder.h"
 #include "tee/runtime/uuid.h"
 #include "tee_client_api.h"
-#include "tests/tee/world_fixture.h"
+#include "tests/remote/server_fixture.h"
 
 namespace hosted_tee::testing {
 namespace {
@@ -40,10 +40,14 @@ class variable {
   std::optional<std::string> before_;
 };
 
-class ClientTest : public WorldTest {
+/// The two ways to one and the same device: in this process, and through a server's socket.
+enum class way { embedded, server };
+
+class ClientTest : public WorldTest, public ::testing::WithParamInterface<way> {
  protected:
   ClientTest() {
     first_ta::apply();
+    if (GetParam() == way::server) server = std::make_unique<running_server>(socket(), world);
     EXPECT_EQ(TEEC_InitializeContext(name().c_str(), &context), TEEC_SUCCESS);
     EXPECT_EQ(open_session(), TEEC_SUCCESS);
   }
@@ -52,7 +56,10 @@ class ClientTest : public WorldTest {
     TEEC_FinalizeContext(&context);
   }
 
-  std::string name() const { return "embedded:" + options.state.string(); }
+  std::string socket() const { return (folder.path() / "tee.sock").string(); }
+  std::string name() const {
+    return GetParam() == way::server ? "unix:" + socket() : "embedded:" + options.state.string();
+  }
 
   TEEC_Result open_session(std::uint32_t method = TEEC_LOGIN_PUBLIC, const void* data = nullptr,
                            TEEC_Operation* with = nullptr) {
@@ -72,20 +79,24 @@ class ClientTest : public WorldTest {
     };
   }
 
+  std::unique_ptr<running_server> server;
   TEEC_Context context{};
   TEEC_Session session{};
   TEEC_Operation operation{};
   std::uint32_t origin = 99;
 };
 
-TEST_F(ClientTest, CommandsReachTheTaWithAndWithoutAnOperation) {
+INSTANTIATE_TEST_SUITE_P(BothWays, ClientTest, ::testing::Values(way::embedded, way::server),
+                         [](const auto& tested) { return tested.param == way::server ? "Server" : "Embedded"; });
+
+TEST_P(ClientTest, CommandsReachTheTaWithAndWithoutAnOperation) {
   expect(0, TEE_SUCCESS, [](TEE_Param*) {});
   EXPECT_EQ(TEEC_InvokeCommand(&session, 5, nullptr, nullptr), TEEC_SUCCESS);
   EXPECT_EQ(invoke(), TEEC_SUCCESS);
   EXPECT_EQ(origin, TEEC_ORIGIN_TRUSTED_APP);
 }
 
-TEST_F(ClientTest, ValuesGoBothWays) {
+TEST_P(ClientTest, ValuesGoBothWays) {
   operation.paramTypes = TEEC_PARAM_TYPES(TEEC_VALUE_INPUT, TEEC_VALUE_OUTPUT, TEEC_VALUE_INOUT, TEEC_NONE);
   for (auto& p : operation.params) p.value = {1, 2};
   expect(0x0321, TEE_ERROR_GENERIC, [](TEE_Param* params) {
@@ -101,7 +112,7 @@ TEST_F(ClientTest, ValuesGoBothWays) {
   EXPECT_EQ(operation.params[3].value.b, 2U);
 }
 
-TEST_F(ClientTest, TemporaryMemoryTellsItsSizeAlsoWhenItWasTooSmall) {
+TEST_P(ClientTest, TemporaryMemoryTellsItsSizeAlsoWhenItWasTooSmall) {
   char in[] = "in";
   char out[4] = {};
   operation.paramTypes =
@@ -122,7 +133,7 @@ TEST_F(ClientTest, TemporaryMemoryTellsItsSizeAlsoWhenItWasTooSmall) {
   EXPECT_EQ(out[0], 'o');
 }
 
-TEST_F(ClientTest, MemoryThatCantBeIsRefusedByTheApiItself) {
+TEST_P(ClientTest, MemoryThatCantBeIsRefusedByTheApiItself) {
   char byte = 0;
   first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) { return ADD_FAILURE(), TEE_SUCCESS; };
   operation.paramTypes = TEEC_MEMREF_TEMP_INPUT;
@@ -145,7 +156,8 @@ TEST_F(ClientTest, MemoryThatCantBeIsRefusedByTheApiItself) {
   }
 }
 
-TEST_F(ClientTest, RegisteredMemoryIsTheClientsOwnWholeOrInParts) {
+// In this process the TA works on the client's own bytes; a server on the bytes that were copied for it.
+TEST_P(ClientTest, RegisteredMemoryIsReachedWholeOrInParts) {
   char block[8] = "abcdefg";
   TEEC_SharedMemory shared{block, 8, TEEC_MEM_INPUT | TEEC_MEM_OUTPUT, {}};
   ASSERT_EQ(TEEC_RegisterSharedMemory(&context, &shared), TEEC_SUCCESS);
@@ -156,11 +168,13 @@ TEST_F(ClientTest, RegisteredMemoryIsTheClientsOwnWholeOrInParts) {
   operation.params[2].memref = {&shared, 0, 8};
   operation.params[3].memref = {&shared, 3, 5};
   expect(0x7657, TEE_SUCCESS, [&](TEE_Param* params) {
-    EXPECT_EQ(params[0].memref.buffer, block);
+    const char* const seen = static_cast<const char*>(params[0].memref.buffer);
+    EXPECT_EQ(seen == block, GetParam() == way::embedded);
+    EXPECT_STREQ(seen, "abcdefg");
     EXPECT_EQ(params[0].memref.size, 8U);
-    EXPECT_EQ(params[1].memref.buffer, block + 1);
+    EXPECT_EQ(params[1].memref.buffer, seen + 1);
     EXPECT_EQ(params[2].memref.size, 0U);
-    EXPECT_EQ(params[3].memref.buffer, block + 5);
+    EXPECT_EQ(params[3].memref.buffer, seen + 5);
     for (std::uint32_t i = 0; i < 4; ++i) params[i].memref.size = i + 20;
   });
   EXPECT_EQ(invoke(), TEEC_SUCCESS);
@@ -173,7 +187,7 @@ TEST_F(ClientTest, RegisteredMemoryIsTheClientsOwnWholeOrInParts) {
   EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS);
 }
 
-TEST_F(ClientTest, PartsMustLieInsideAndGoTheMemorysWay) {
+TEST_P(ClientTest, PartsMustLieInsideAndGoTheMemorysWay) {
   char block[8] = {};
   TEEC_SharedMemory shared{block, 8, TEEC_MEM_INPUT, {}};
   ASSERT_EQ(TEEC_RegisterSharedMemory(&context, &shared), TEEC_SUCCESS);
@@ -190,7 +204,7 @@ TEST_F(ClientTest, PartsMustLieInsideAndGoTheMemorysWay) {
   TEEC_ReleaseSharedMemory(&shared);
 }
 
-TEST_F(ClientTest, AllocatedMemoryIsGivenAndTakenBack) {
+TEST_P(ClientTest, AllocatedMemoryIsGivenAndTakenBack) {
   TEEC_SharedMemory shared{nullptr, 0, TEEC_MEM_OUTPUT, {}};
   ASSERT_EQ(TEEC_AllocateSharedMemory(&context, &shared), TEEC_SUCCESS);
   EXPECT_NE(shared.buffer, nullptr);
@@ -206,7 +220,36 @@ TEST_F(ClientTest, AllocatedMemoryIsGivenAndTakenBack) {
   TEEC_ReleaseSharedMemory(nullptr);
 }
 
-TEST_F(ClientTest, APanicIsTheTeesAnswerAndTheSessionStaysDead) {
+TEST_P(ClientTest, MemoryThatCouldNotBeAllocatedHasNoAddress) {
+  char byte = 0;
+  TEEC_SharedMemory shared{&byte, TEEC_CONFIG_SHAREDMEM_MAX_SIZE + 1, TEEC_MEM_OUTPUT, {}};
+  EXPECT_EQ(TEEC_AllocateSharedMemory(&context, &shared), TEEC_ERROR_OUT_OF_MEMORY);
+  EXPECT_EQ(shared.buffer, nullptr);
+  TEEC_ReleaseSharedMemory(&shared);
+  shared = {&byte, 1, TEEC_MEM_OUTPUT, {}};
+  EXPECT_EQ(TEEC_AllocateSharedMemory(nullptr, &shared), TEEC_ERROR_BAD_PARAMETERS);
+  EXPECT_EQ(shared.buffer, nullptr);
+}
+
+TEST_P(ClientTest, MemoryOfAnotherContextIsRefused) {
+  first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) { return ADD_FAILURE(), TEE_SUCCESS; };
+  TEEC_Context other{};
+  ASSERT_EQ(TEEC_InitializeContext(name().c_str(), &other), TEEC_SUCCESS);
+  char own[10] = {};
+  TEEC_SharedMemory allocated{nullptr, 10, TEEC_MEM_INPUT, {}}, registered{own, 10, TEEC_MEM_INPUT, {}};
+  ASSERT_EQ(TEEC_AllocateSharedMemory(&other, &allocated), TEEC_SUCCESS);
+  ASSERT_EQ(TEEC_RegisterSharedMemory(&other, &registered), TEEC_SUCCESS);
+  for (TEEC_SharedMemory* memory : {&allocated, &registered}) {
+    operation.paramTypes = TEEC_MEMREF_WHOLE;
+    operation.params[0].memref = {memory, 0, 0};
+    EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS);
+    EXPECT_EQ(origin, TEEC_ORIGIN_API);
+    TEEC_ReleaseSharedMemory(memory);
+  }
+  TEEC_FinalizeContext(&other);
+}
+
+TEST_P(ClientTest, APanicIsTheTeesAnswerAndTheSessionStaysDead) {
   first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) -> TEE_Result { TEE_Panic(3); };
   for (int i = 0; i < 2; ++i) {
     EXPECT_EQ(invoke(), TEEC_ERROR_TARGET_DEAD);
@@ -217,7 +260,7 @@ TEST_F(ClientTest, APanicIsTheTeesAnswerAndTheSessionStaysDead) {
   EXPECT_EQ(invoke(), TEEC_SUCCESS);
 }
 
-TEST_F(ClientTest, SessionsOpenWithParametersAndSayWhereTheyFailed) {
+TEST_P(ClientTest, SessionsOpenWithParametersAndSayWhereTheyFailed) {
   operation.paramTypes = TEEC_VALUE_INOUT;
   operation.params[0].value = {1, 0};
   first.open = [](std::uint32_t, TEE_Param* params, void**) {
@@ -233,7 +276,7 @@ TEST_F(ClientTest, SessionsOpenWithParametersAndSayWhereTheyFailed) {
   EXPECT_EQ(origin, TEEC_ORIGIN_TEE);
 }
 
-TEST_F(ClientTest, LoginsGiveTheTaAnIdentity) {
+TEST_P(ClientTest, LoginsGiveTheTaAnIdentity) {
   TEE_Identity seen{};
   first.open = [&](std::uint32_t, TEE_Param*, void**) {
     return TEE_GetPropertyAsIdentity(TEE_PROPSET_CURRENT_CLIENT, "gpd.client.identity", &seen);
@@ -256,7 +299,7 @@ TEST_F(ClientTest, LoginsGiveTheTaAnIdentity) {
   EXPECT_TRUE(same_uuid(seen.uuid, {}));
 }
 
-TEST_F(ClientTest, LoginsThatCantBeVouchedForAreRefused) {
+TEST_P(ClientTest, LoginsThatCantBeVouchedForAreRefused) {
   const std::uint32_t strangers = 0x7FFFFFF0;
   EXPECT_EQ(open_session(TEEC_LOGIN_GROUP, &strangers), TEEC_ERROR_ACCESS_DENIED);
   EXPECT_EQ(open_session(TEEC_LOGIN_GROUP, nullptr), TEEC_ERROR_BAD_PARAMETERS);
@@ -266,7 +309,7 @@ TEST_F(ClientTest, LoginsThatCantBeVouchedForAreRefused) {
   EXPECT_EQ(origin, TEEC_ORIGIN_API);
 }
 
-TEST_F(ClientTest, NullArgumentsAreBadParametersOrNothing) {
+TEST_P(ClientTest, NullArgumentsAreBadParametersOrNothing) {
   TEEC_Session none{};
   EXPECT_EQ(TEEC_InvokeCommand(nullptr, 0, nullptr, &origin), TEEC_ERROR_BAD_PARAMETERS);
   EXPECT_EQ(TEEC_InvokeCommand(&none, 0, nullptr, &origin), TEEC_ERROR_BAD_PARAMETERS);
@@ -278,7 +321,7 @@ TEST_F(ClientTest, NullArgumentsAreBadParametersOrNothing) {
   TEEC_RequestCancellation(nullptr);
 }
 
-TEST_F(ClientTest, ContextsOfOneFolderShareTheDeviceAndKeepItRunning) {
+TEST_P(ClientTest, ContextsOfOneFolderShareTheDeviceAndKeepItRunning) {
   TEEC_Context second_context{};
   ASSERT_EQ(TEEC_InitializeContext(name().c_str(), &second_context), TEEC_SUCCESS);
   world.reset();
@@ -290,6 +333,7 @@ TEST_F(ClientTest, ContextsOfOneFolderShareTheDeviceAndKeepItRunning) {
   TEEC_FinalizeContext(&second_context);
   TEEC_CloseSession(&session);
   TEEC_FinalizeContext(&context);
+  server.reset();  // which is the last to let go where there is one
   EXPECT_EQ(secure_world::find_open(options.state), nullptr);
 }
 
@@ -332,7 +376,7 @@ TEST_F(ContextTest, TheDefaultFolderFollowsTheXdgRules) {
 }
 
 TEST_F(ContextTest, OtherFormsOfNamesAreRefused) {
-  for (const char* name : {"", "embedded:", "unix", "embedded", "/tmp/x"}) {
+  for (const char* name : {"", "embedded:", "unix", "unix:", "embedded", "/tmp/x"}) {
     EXPECT_EQ(initialize(name), TEEC_ERROR_BAD_PARAMETERS) << name;
   }
 }
