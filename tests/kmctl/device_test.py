@@ -136,7 +136,7 @@ class Provisioning(DeviceTest):
                           ["--passphrase-file", self.path("letter.txt")]):
             with self.subTest(arguments=arguments):
                 self.kmctl("device", "provision", *arguments, expect=USAGE)
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
         self.provision("--cpu-id", "x" * 63, "--device-id", "sixteen bytes...")
         self.assertEqual(self.json("attest", "device-id")["device_id"], b"sixteen bytes...".hex())
 
@@ -145,7 +145,7 @@ class Provisioning(DeviceTest):
         for path in (self.private_key(1024, "small.pem"), self.path("ec.pem"), self.data, self.path("none")):
             with self.subTest(path=path):
                 self.kmctl("device", "provision", "--key", path, expect=FAILURE)
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
 
 
 class TheLock(DeviceTest):
@@ -165,7 +165,7 @@ class TheLock(DeviceTest):
 
     def test_a_record_that_cannot_be_written_leaves_the_device_open(self):
         self.kmctl("device", "provision", "--record", self.path("no/such/folder"), "--lock", expect=FAILURE)
-        self.assertFalse(os.path.exists(self.state), "nothing is made before the record's place is known to be good")
+        self.assert_no_device("nothing is made before the record's place is known to be good")
         self.kmctl("device", "provision", "--record", "/dev/full", "--lock", expect=FAILURE)
         self.assertEqual(self.json("device", "status"), PROVISIONED)
 
@@ -193,7 +193,7 @@ class TheSecondTime(DeviceTest):
         kept = self.read("attk-private.pem")
         self.kmctl("device", "provision", "--key", key, "--record", key, "--force", expect=USAGE)
         self.assertEqual(self.read("attk-private.pem"), kept)
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
 
 
 class TheCommandLine(DeviceTest):
@@ -219,7 +219,7 @@ class TheCommandLine(DeviceTest):
                 self.kmctl(group, "sign", expect=USAGE)  # one of another place
         self.assertEqual(self.failure("device", "status", "--frobnicate", expect=USAGE)["hint"],
                          "see kmctl device status --help")
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
 
     def test_the_programs_own_options_stand_anywhere(self):
         for words in (["--json", "device", "status"], ["device", "--json", "status"], ["device", "status", "--json"]):

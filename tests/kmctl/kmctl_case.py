@@ -5,6 +5,7 @@ import os
 import subprocess
 import sys
 import tempfile
+import time
 import unittest
 
 DONE, FAILURE, USAGE, TEE_ERROR, KEYMASTER, NO_CONNECTION, INVALID = range(7)
@@ -24,8 +25,39 @@ def openssl(*arguments, data=None, check=True):
     return subprocess.run(["openssl", *arguments], input=data, capture_output=True, check=check)
 
 
+class Servers:
+    """One teed for each device, where tests are to meet their devices through servers."""
+
+    program = os.environ.get("KMCTL_THROUGH")  # teed
+
+    def __init__(self, folder):
+        self.folder = folder
+        self.processes, self.names = [], {}
+
+    def name_of(self, state):
+        """The name of the TEE, whose server is started when it is first asked for."""
+        if state not in self.names:
+            socket = os.path.join(self.folder, f"{len(self.names)}.sock")
+            server = subprocess.Popen([self.program, "--state", state, "--socket", socket], stderr=subprocess.DEVNULL)
+            self.processes.append(server)
+            while not os.path.exists(socket) and server.poll() is None:
+                time.sleep(0.01)
+            self.names[state] = "unix:" + socket
+        return self.names[state]
+
+    def end(self):
+        """Whether all of them ended as they should."""
+        for server in self.processes:
+            server.terminate()
+        return all([server.wait() == 0 for server in self.processes])
+
+
+embedded_only = unittest.skipIf(Servers.program, "about the state folder, which is the server's")
+
+
 class KmctlTest(unittest.TestCase):
     program = ""  # kmctl
+    servers = None  # if devices are met through servers
     shared_state = None  # a device that tests may share which only need some device
 
     def setUp(self):
@@ -51,7 +83,8 @@ class KmctlTest(unittest.TestCase):
         kept = {k: v for k, v in os.environ.items() if not k.startswith("KEYMASTER_") or k == "KEYMASTER_TA_PATH"}
         # A sanitizer's finding must not pass for an exit code of kmctl.
         findings = {"ASAN_OPTIONS": "exitcode=99", "UBSAN_OPTIONS": "exitcode=99", "LSAN_OPTIONS": "exitcode=99"}
-        return {**kept, **findings, "KEYMASTER_STATE": self.state, **extra}
+        device = {"KEYMASTER_TEE": self.servers.name_of(self.state)} if self.servers else {"KEYMASTER_STATE": self.state}
+        return {**kept, **findings, **device, **extra}
 
     def kmctl(self, *arguments, expect=DONE, data=b"", **extra):
         """Runs kmctl and asserts its exit code."""
@@ -83,6 +116,11 @@ class KmctlTest(unittest.TestCase):
         """Nothing is left behind but these, and what setUp made."""
         self.assertEqual(sorted(os.listdir(self.folder)), sorted([*names, "letter.txt"]))
 
+    def assert_no_device(self, why=None):
+        """Nothing has asked for the device yet. A server is there before it is asked."""
+        if not self.servers:
+            self.assertFalse(os.path.exists(self.state), why)
+
 
 def main(usage):
     """Runs the tests of the calling script: SCRIPT KMCTL [unittest arguments]."""
@@ -91,4 +129,8 @@ def main(usage):
     KmctlTest.program = os.path.abspath(sys.argv.pop(1))
     with tempfile.TemporaryDirectory(prefix="kmctl-device-") as folder:
         KmctlTest.shared_state = os.path.join(folder, "state")
-        unittest.main(argv=sys.argv, verbosity=1)
+        KmctlTest.servers = Servers(folder) if Servers.program else None
+        result = unittest.main(argv=sys.argv, verbosity=1, exit=False).result
+        if KmctlTest.servers and not KmctlTest.servers.end():
+            sys.exit("a server did not end as it should")
+        sys.exit(not result.wasSuccessful())

@@ -14,7 +14,7 @@ import re
 import subprocess
 
 from kmctl_case import (DIGESTS, DONE, EMULATED, FAILURE, INVALID, KEYMASTER, LONG_KEY, NO_CONNECTION, TEE_ERROR, USAGE,
-                        KmctlTest, main, openssl)
+                        KmctlTest, embedded_only, main, openssl)
 
 
 class Keys(KmctlTest):
@@ -367,6 +367,7 @@ class Refusals(KmctlTest):
         self.assertIn("sha-256", answer["hint"])
 
 
+@embedded_only
 class Devices(KmctlTest):
     def setUp(self):
         super().setUp()

@@ -9,7 +9,7 @@ import os
 import resource
 import subprocess
 
-from kmctl_case import DONE, FAILURE, INVALID, KEYMASTER, NO_CONNECTION, USAGE, KmctlTest, main, openssl
+from kmctl_case import DONE, FAILURE, INVALID, KEYMASTER, NO_CONNECTION, USAGE, KmctlTest, embedded_only, main, openssl
 
 CLOSED = {"stdin": "0<&-", "stdout": "1>&-", "stderr": "2>&-"}
 
@@ -257,6 +257,7 @@ class Folders(KmctlTest):
                       self.kmctl("--trace", "error", "--state", self.folder, "info", expect=NO_CONNECTION).stderr)
         self.assert_folder_holds()
 
+    @embedded_only
     def test_every_failure_says_what_to_try(self):
         blob = self.generate("--size", "1024")
         os.mkdir(self.path("images"))

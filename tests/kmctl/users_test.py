@@ -116,7 +116,7 @@ class Fingers(UsersTest):
                           ["touch", str(1 << 32)], ["touch", "1", "--challenge", "x"], ["remove", ""]):
             with self.subTest(arguments=arguments):
                 self.kmctl("finger", *arguments, expect=USAGE)
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
 
 
 class Passwords(UsersTest):
@@ -209,7 +209,7 @@ class Passwords(UsersTest):
         for command in (["enrol", "-o", self.path("handle")], ["token", self.data]):
             self.kmctl("auth", *command, "--uid", "1", "--password-file", empty, expect=FAILURE)
             self.kmctl("auth", *command, "--uid", "1", "--password-file", self.path("none"), expect=FAILURE)
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
         long = self.write("long", b"x" * 1025)
         told = self.failure("auth", "enrol", "--uid", "1", "--password-file", long, "-o", self.path("handle"),
                             expect=TEE_ERROR)
@@ -317,7 +317,7 @@ class OnATerminal(UsersTest):
                                 env=self.environment(), check=False, start_new_session=True, stdin=subprocess.DEVNULL)
         self.assertEqual(result.returncode, USAGE)
         self.assertIn(b"--password-file", result.stderr)
-        self.assertFalse(os.path.exists(self.state))
+        self.assert_no_device()
 
 
 if __name__ == "__main__":
