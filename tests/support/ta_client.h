@@ -36,7 +36,7 @@ class ta_client {
   explicit ta_client(const std::string& context_name, const TEEC_UUID& ta = KEYMASTER_TA_UUID);
   ta_client(const ta_client&) = delete;
   ta_client& operator=(const ta_client&) = delete;
-  ~ta_client();
+  virtual ~ta_client();
 
   /// call sends `request` in slot 1 and offers `capacity` bytes in slot 2; an absent one makes its slot NONE. Slot 0 is
   /// VALUE_INOUT.
@@ -44,8 +44,9 @@ class ta_client {
               std::optional<std::size_t> capacity);
 
   /// call_types is call with parameter types of the caller's choice (TEEC numbers); slots get what their type asks for.
-  answer call_types(std::uint32_t command, std::uint32_t types, std::uint32_t a, std::uint32_t b, const bytes& request,
-                    std::size_t capacity);
+  /// Every command goes through it.
+  virtual answer call_types(std::uint32_t command, std::uint32_t types, std::uint32_t a, std::uint32_t b,
+                            const bytes& request, std::size_t capacity);
 
   // The commands, well-formed. Capacities are ample unless given.
   answer generate(const param_list& params, std::size_t capacity = 16384);
@@ -72,7 +73,7 @@ class ta_client {
   finish_answer sign(const bytes& blob, const param_list& params, const bytes& message);
   finish_answer verify(const bytes& blob, const param_list& params, const bytes& message, const bytes& signature);
 
- private:
+ protected:
   TEEC_Context context_ = {};
   TEEC_Session session_ = {};
 };

@@ -1,0 +1,38 @@
+// A server with provisioned device and shelf, and what it has when nobody is there.
+#ifndef TESTS_LOAD_LOAD_FIXTURE_H_
+#define TESTS_LOAD_LOAD_FIXTURE_H_
+
+#include <gtest/gtest.h>
+
+#include "tests/load/teed_process.h"
+#include "tests/load/worker.h"
+
+namespace load {
+
+class LoadTest : public ::testing::Test {
+ protected:
+  LoadTest();
+
+  teed_process teed;
+  key_shelf keys;
+
+  /// Some hundred steps of one client, so that whatever is made once is made.
+  void warm_up();
+
+  /// What the server has when nobody is there, as soon as it is so.
+  [[nodiscard]] holdings at_rest();
+
+  /// What a new instance of the TA has, which is that of a client's first session. There must not be another one.
+  [[nodiscard]] hosted_tee::ta_status fresh_instance();
+
+  /// expect_as_before waits until the server has what it had at rest, and compares a fresh instance as well.
+  void expect_as_before(const holdings& rest, const hosted_tee::ta_status& fresh);
+
+  void expect_good_end() { EXPECT_EQ(teed.stop(), 0); }
+};
+
+void expect_same(const hosted_tee::ta_status& now, const hosted_tee::ta_status& before);
+
+}  // namespace load
+
+#endif  // TESTS_LOAD_LOAD_FIXTURE_H_
