@@ -37,10 +37,12 @@ class SlotServerTest : public ServerTest {
     if (thread.joinable()) thread.join();
   }
 
-  /// serve_once takes a client's slots, and its first request out of them.
-  void serve_once(act play) {
+  /// serve_once takes a client's slots, and its first request out of them. A server that `stays` after `play` leaves
+  /// the end to the client.
+  void serve_once(act play, bool stays) {
+    client_has_left = false;
     file = std::make_unique<listening_socket>(path(), 0600);
-    thread = std::thread([listener = file->take(), play = std::move(play)] {
+    thread = std::thread([this, listener = file->take(), play = std::move(play), stays] {
       ::fcntl(listener.get(), F_SETFL, 0);
       const file_descriptor peer(::accept(listener.get(), nullptr, nullptr));
       bytes room(remote::frame_limit);
@@ -53,14 +55,16 @@ class SlotServerTest : public ServerTest {
         slots.request().store(0);
         play({slots, peer.get(), 3});
       }
+      std::uint8_t nothing = 0;
+      client_has_left = stays && eventually([&] { return ::recv(peer.get(), &nothing, 1, MSG_DONTWAIT) == 0; });
     });
   }
 
   /// opens tells what the first request's result is.
-  TEEC_Result opens(const act& play) {
+  TEEC_Result opens(const act& play, bool stays = false) {
     if (thread.joinable()) thread.join();
     file.reset();
-    serve_once(play);
+    serve_once(play, stays);
     TEEC_Context context{};
     TEEC_Session session{};
     TEEC_UUID ta{};
@@ -71,13 +75,20 @@ class SlotServerTest : public ServerTest {
     return result;
   }
 
-  void expect_broken(const act& play) {
+  void expect_gone(const act& play) {
     EXPECT_EQ(opens(play), TEEC_ERROR_COMMUNICATION);
     EXPECT_EQ(origin, TEEC_ORIGIN_COMMS);
+  }
+  void expect_broken(const act& play) {
+    EXPECT_EQ(opens(play, true), TEEC_ERROR_COMMUNICATION);
+    EXPECT_EQ(origin, TEEC_ORIGIN_COMMS);
+    thread.join();
+    EXPECT_TRUE(client_has_left);
   }
 
   std::unique_ptr<listening_socket> file;
   std::thread thread;
+  bool client_has_left = false;
   std::uint32_t origin = 99;
 };
 
@@ -89,6 +100,17 @@ TEST_F(SlotServerTest, AnAnswerInTheSlotIsTaken) {
             }),
             TEEC_SUCCESS);
   EXPECT_EQ(origin, TEEC_ORIGIN_TRUSTED_APP);
+}
+
+// As of a server that finishes a command and ends.
+TEST_F(SlotServerTest, AnAnswerThatIsFollowedByTheEndIsTaken) {
+  for (int i = 0; i < 200; ++i) {
+    ASSERT_EQ(opens([](const slot_request& request) {
+                const bytes answer = sound_answer(request.sequence);
+                request.answer(answer, static_cast<std::uint32_t>(answer.size()));
+              }),
+              TEEC_SUCCESS);
+  }
 }
 
 TEST_F(SlotServerTest, AnAnswerToAClientThatSleepsIsTaken) {
@@ -122,8 +144,8 @@ TEST_F(SlotServerTest, AWakeUpWithoutAnAnswerBreaksTheConnection) {
 }
 
 TEST_F(SlotServerTest, AServerThatDiesIsNoticedWhetherTheClientSleepsOrNot) {
-  expect_broken([](const slot_request&) {});
-  expect_broken(
+  expect_gone([](const slot_request&) {});
+  expect_gone(
       [](const slot_request& request) { EXPECT_TRUE(eventually([&] { return request.slots.answer().load() == 1; })); });
 }
 
