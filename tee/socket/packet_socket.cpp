@@ -32,6 +32,9 @@ std::vector<file_descriptor> take_descriptors(msghdr& message) {
       int fd = -1;
       std::memcpy(&fd, CMSG_DATA(part) + i * sizeof fd, sizeof fd);
       taken.emplace_back(fd);
+      // Whoever sent a socket may have left it so that closing waits for the network, as long as it likes.
+      constexpr linger none{};
+      (void)::setsockopt(fd, SOL_SOCKET, SO_LINGER, &none, sizeof none);
     }
   }
   return taken;

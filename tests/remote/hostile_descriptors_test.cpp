@@ -1,5 +1,6 @@
 // Clients that pass descriptors that nobody asked for, or that are not what they should be.
 #include <fcntl.h>
+#include <netinet/in.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
 
@@ -60,6 +61,37 @@ TEST_F(HostileDescriptorsTest, FilesThatCouldBeCutShortAreRefused) {
     EXPECT_EQ(share(made_file(page, seals).get()).done.result, TEEC_ERROR_BAD_PARAMETERS) << seals;
   }
   expect_served();
+}
+
+/// A connection over the network with more sent than is taken, so that its last close waits for `patience`.
+file_descriptor lingering_socket(const file_descriptor& listener, std::chrono::seconds patience) {
+  sockaddr_in place{};
+  socklen_t length = sizeof place;
+  place.sin_family = AF_INET;
+  place.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  EXPECT_EQ(::bind(listener.get(), reinterpret_cast<sockaddr*>(&place), length), 0);
+  EXPECT_EQ(::listen(listener.get(), 1), 0);
+  EXPECT_EQ(::getsockname(listener.get(), reinterpret_cast<sockaddr*>(&place), &length), 0);
+  file_descriptor socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  EXPECT_EQ(::connect(socket.get(), reinterpret_cast<sockaddr*>(&place), length), 0);
+  const bytes block(65536);
+  while (::send(socket.get(), block.data(), block.size(), MSG_DONTWAIT) > 0) {
+  }
+  const linger waits{1, static_cast<int>(patience.count())};
+  EXPECT_EQ(::setsockopt(socket.get(), SOL_SOCKET, SO_LINGER, &waits, sizeof waits), 0);
+  return socket;
+}
+
+TEST_F(HostileDescriptorsTest, ASocketThatLingersHoldsNobodyUp) {
+  const file_descriptor listener(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  file_descriptor socket = lingering_socket(listener, std::chrono::minutes(5));
+  const bytes frame = raw_frame(frame_kind::share_memory, body_of(remote::share_request{page, 1}));
+  ASSERT_EQ(send_packet(client->socket(), frame, socket.get()), 0);
+  socket = {};
+  client.reset();
+  EXPECT_TRUE(has_let_go());
+  server->stop();
+  server->join();
 }
 
 TEST_F(HostileDescriptorsTest, FilesOfOtherKindsAreRefused) {
