@@ -22,22 +22,25 @@ constexpr const char* status_examples =
     "Operations are the operation handles that a TA has open; heap is in bytes: in use, the most there ever was since\n"
     "the TA's instance began, and the limit. Only the server's own user and root are answered.\n\n"
     "Examples:\n"
-    "  kmctl --tee unix:/run/keymaster/teed.socket tee status\n"
-    "  kmctl --tee unix:/run/keymaster/teed.socket tee status --json | jq '.tas[].heap_peak'\n";
+    "  export KEYMASTER_TEE=unix:/run/keymaster/teed.socket\n"
+    "  kmctl tee status\n"
+    "  kmctl tee status --json | jq '.tas[].heap_peak'\n";
 
 constexpr const char* log_examples =
     "The server keeps the latest lines, errors alone unless it was started with --keep-trace. Only its own user and\n"
     "root are answered.\n\n"
     "Examples:\n"
-    "  kmctl --tee unix:/run/keymaster/teed.socket tee log\n"
-    "  kmctl --tee unix:/run/keymaster/teed.socket tee log --lines 20\n"
-    "  kmctl --tee unix:/run/keymaster/teed.socket tee log --json | jq -r '.lines[].text'\n";
+    "  export KEYMASTER_TEE=unix:/run/keymaster/teed.socket\n"
+    "  kmctl tee log\n"
+    "  kmctl tee log --lines 20\n"
+    "  kmctl tee log --json | jq -r '.lines[].text'\n";
 
 constexpr const char* stop_examples =
     "Commands that run are finished, then all sessions are closed; the command waits until that is done. A server "
     "that\n"
     "systemd starts by its socket comes back with the next client. Only the server's own user and root are obeyed.\n\n"
     "Examples:\n"
+    "  kmctl tee stop\n"
     "  kmctl --tee unix:/run/keymaster/teed.socket tee stop\n";
 
 void check(const hosted_tee::management_failure& failed, const char* step, client::error_kind kind) {
