@@ -30,8 +30,7 @@ enum device_information_command_t : std::uint32_t {
   /// MEMREF_INPUT name, MEMREF_OUTPUT value.
   DEVICE_INFORMATION_GET_TA_PROPERTY = 2,
   /// What the device is like now. VALUE_OUTPUT `a`: 1 when the RPMB storage can be used, else 0; VALUE_OUTPUT the
-  /// system
-  /// time and VALUE_OUTPUT the REE time, each seconds in `a` and milliseconds in `b`.
+  /// system time and VALUE_OUTPUT the REE time, each seconds in `a` and milliseconds in `b`.
   DEVICE_INFORMATION_GET_STATE = 3,
 };
 

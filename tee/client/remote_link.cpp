@@ -19,7 +19,7 @@ constexpr std::uint32_t both_ways = TEEC_MEM_INPUT | TEEC_MEM_OUTPUT;
 
 // Kept between operations, so that those of usual size don't make it anew each time.
 constexpr std::size_t least_staging = std::size_t{256} * 1024;
-constexpr std::size_t most_kept_staging = std::size_t{4} * 1024 * 1024;
+constexpr std::size_t most_kept_staging = std::size_t{1} * 1024 * 1024;
 
 // The server asks who is on the other side itself; of a group login only the choice among the groups is told.
 std::uint32_t group_of(std::uint32_t method, const void* connection_data) {

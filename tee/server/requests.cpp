@@ -129,6 +129,8 @@ bool connection::use_slots(const remote::frame& request, int file) {
     told.done = refused(TEEC_ERROR_BAD_STATE);
   } else if (!frame_channel::wants_slots()) {
     told.done = refused(TEEC_ERROR_NOT_SUPPORTED);
+  } else if (file < 0) {
+    told.done = refused(TEEC_ERROR_OUT_OF_MEMORY);  // this process can't have another descriptor
   } else if (!is_safe_to_share(file, layout.size())) {
     told.done = refused(TEEC_ERROR_BAD_PARAMETERS);
   } else if (auto memory = map_file(file, layout.size())) {

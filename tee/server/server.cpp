@@ -80,6 +80,7 @@ bool server::wait(int also_stops) {
 void server::run(int also_stops) {
   while (wait(also_stops)) accept_some();
   if (on_stopping_) on_stopping_();
+  listener_ = {};  // who still waits there is told at once
   end_all();
   core_.world.reset();
 }
