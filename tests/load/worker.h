@@ -26,8 +26,8 @@ struct worker_seed {
 };
 
 /// work connects to `tee` and does steps while `goes_on`; now and then it leaves and connects again. Its first step is
-/// that of its number, repeated until there is a place for it. Throws
-/// std::runtime_error, which names worker, step and seed, for the first answer that is wrong.
+/// that of its number, repeated until there is a place for it. Throws std::runtime_error, which names worker, step and
+/// seed, for the first answer that is wrong.
 void work(const std::string& tee, worker_seed seed, const key_shelf& keys, tally& counts,
           const std::function<bool()>& goes_on);
 

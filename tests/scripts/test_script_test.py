@@ -67,6 +67,7 @@ class TestScript(unittest.TestCase):
             "passed  Benchmarks, one round",
             "passed  Fuzzing",
             "passed  Tests of release: 100% tests passed, 0 tests failed out of 3",
+            "passed  Load test of release: 100% tests passed, 0 tests failed out of 3",
             "passed  Tests of asan: 100% tests passed, 0 tests failed out of 3",
             "passed  Tests of tsan: 100% tests passed, 0 tests failed out of 3",
             "passed  Tests of arm, emulated: 100% tests passed, 0 tests failed out of 3",
@@ -78,13 +79,13 @@ class TestScript(unittest.TestCase):
             status, outcome = self.run_test(failing)
             self.assertEqual(status, 1)
             self.assertIn(line, outcome)
-            self.assertEqual(len(self.called("ctest")), 4)
+            self.assertEqual(len(self.called("ctest")), 5)
 
     def test_libraries_for_arm_that_cannot_be_had_fail_the_run(self):
         status, outcome = self.run_test("arm-sysroot")
         self.assertEqual(status, 1)
-        self.assertEqual(outcome[5], "FAILED  Tests of arm, emulated")
-        self.assertEqual(len(self.called("ctest")), 3)
+        self.assertEqual(outcome[6], "FAILED  Tests of arm, emulated")
+        self.assertEqual(len(self.called("ctest")), 4)
 
     def test_a_compiler_for_arm_that_cannot_be_installed_fails_the_run(self):
         self.stand_in(self.programs / "dpkg-query", 'case "$*" in *g++-arm*) exit 1 ;; esac; printf installed')
@@ -92,13 +93,15 @@ class TestScript(unittest.TestCase):
         self.stand_in(self.programs / "id", "echo 0")
         status, outcome = self.run_test()
         self.assertEqual(status, 1)
-        self.assertEqual(outcome[5], "FAILED  Tests of arm: its compiler and emulator cannot be installed here")
+        self.assertEqual(outcome[6], "FAILED  Tests of arm: its compiler and emulator cannot be installed here")
 
     def test_failed_tests_are_named(self):
         status, outcome = self.run_test("ctest-release")
         self.assertEqual(status, 1)
-        self.assertEqual(outcome[2:5], [
+        self.assertEqual(outcome[2:7], [
             "FAILED  Tests of release: 67% tests passed, 1 tests failed out of 3",
+            "        2 - ctest-release_that_failed (Failed)",
+            "FAILED  Load test of release: 67% tests passed, 1 tests failed out of 3",
             "        2 - ctest-release_that_failed (Failed)",
             "passed  Tests of asan: 100% tests passed, 0 tests failed out of 3"])
 
