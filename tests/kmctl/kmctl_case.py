@@ -32,24 +32,26 @@ class Servers:
 
     def __init__(self, folder):
         self.folder = folder
-        self.processes, self.names = [], {}
+        self.started, self.sockets = {}, 0
+        self.ended_well = True
 
-    def name_of(self, state):
-        """The name of the TEE, whose server is started when it is first asked for."""
-        if state not in self.names:
-            socket = os.path.join(self.folder, f"{len(self.names)}.sock")
+    def socket_of(self, state):
+        """The socket of a device's server, which is started when it is first asked for."""
+        if state not in self.started:
+            self.sockets += 1
+            socket = os.path.join(self.folder, f"{self.sockets}.sock")
             server = subprocess.Popen([self.program, "--state", state, "--socket", socket], stderr=subprocess.DEVNULL)
-            self.processes.append(server)
+            self.started[state] = server, socket
             while not os.path.exists(socket) and server.poll() is None:
                 time.sleep(0.01)
-            self.names[state] = "unix:" + socket
-        return self.names[state]
+        return self.started[state][1]
 
-    def end(self):
-        """Whether all of them ended as they should."""
-        for server in self.processes:
+    def end_below(self, folder):
+        """Ends the servers of devices below a folder, which is to be removed."""
+        for state in [state for state in self.started if state.startswith(folder + os.sep)]:
+            server, _ = self.started.pop(state)
             server.terminate()
-        return all([server.wait() == 0 for server in self.processes])
+            self.ended_well = server.wait() == 0 and self.ended_well
 
 
 embedded_only = unittest.skipIf(Servers.program, "about the state folder, which is the server's")
@@ -64,6 +66,8 @@ class KmctlTest(unittest.TestCase):
         folder = tempfile.TemporaryDirectory(prefix="kmctl-test-")
         self.addCleanup(folder.cleanup)
         self.folder = folder.name
+        if self.servers:
+            self.addCleanup(self.servers.end_below, self.folder)
         self.state = self.shared_state
         self.data = self.write("letter.txt", b"Dear reader,\n" * 20000)  # several chunks of 64 KiB
 
@@ -83,7 +87,9 @@ class KmctlTest(unittest.TestCase):
         kept = {k: v for k, v in os.environ.items() if not k.startswith("KEYMASTER_") or k == "KEYMASTER_TA_PATH"}
         # A sanitizer's finding must not pass for an exit code of kmctl.
         findings = {"ASAN_OPTIONS": "exitcode=99", "UBSAN_OPTIONS": "exitcode=99", "LSAN_OPTIONS": "exitcode=99"}
-        device = {"KEYMASTER_TEE": self.servers.name_of(self.state)} if self.servers else {"KEYMASTER_STATE": self.state}
+        device = {"KEYMASTER_STATE": self.state}
+        if self.servers:
+            device = {"KEYMASTER_TEE": "unix:" + self.servers.socket_of(self.state)}
         return {**kept, **findings, **device, **extra}
 
     def kmctl(self, *arguments, expect=DONE, data=b"", **extra):
@@ -131,6 +137,8 @@ def main(usage):
         KmctlTest.shared_state = os.path.join(folder, "state")
         KmctlTest.servers = Servers(folder) if Servers.program else None
         result = unittest.main(argv=sys.argv, verbosity=1, exit=False).result
-        if KmctlTest.servers and not KmctlTest.servers.end():
-            sys.exit("a server did not end as it should")
+        if KmctlTest.servers:
+            KmctlTest.servers.end_below(folder)
+            if not KmctlTest.servers.ended_well:
+                sys.exit("a server did not end as it should")
         sys.exit(not result.wasSuccessful())

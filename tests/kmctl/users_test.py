@@ -236,10 +236,11 @@ class Passwords(UsersTest):
 class OnATerminal(UsersTest):
     def start(self, *arguments):
         """Starts kmctl on a terminal of its own; gives the process and the terminal's other end."""
+        environment = self.environment()  # a device's server, if it starts one, is not the terminal's
         process, terminal = pty.fork()
         if process == 0:
             os.chdir(self.folder)
-            os.execve(self.program, [self.program, *arguments], self.environment())
+            os.execve(self.program, [self.program, *arguments], environment)
         return process, terminal
 
     def read_until(self, terminal, text):
