@@ -40,14 +40,15 @@ class Servers:
         if state not in self.started:
             self.sockets += 1
             socket = os.path.join(self.folder, f"{self.sockets}.sock")
-            server = subprocess.Popen([self.program, "--state", state, "--socket", socket], stderr=subprocess.DEVNULL)
+            server = subprocess.Popen([self.program, "--state", state, "--socket", socket], stdout=subprocess.DEVNULL,
+                                      stderr=subprocess.DEVNULL)
             self.started[state] = server, socket
             while not os.path.exists(socket) and server.poll() is None:
                 time.sleep(0.01)
         return self.started[state][1]
 
     def end_below(self, folder):
-        """Ends the servers of devices below a folder, which is to be removed."""
+        """Ends the servers of devices below a folder, which is to be removed; of all devices when it is empty."""
         for state in [state for state in self.started if state.startswith(folder + os.sep)]:
             server, _ = self.started.pop(state)
             server.terminate()
@@ -138,7 +139,7 @@ def main(usage):
         KmctlTest.servers = Servers(folder) if Servers.program else None
         result = unittest.main(argv=sys.argv, verbosity=1, exit=False).result
         if KmctlTest.servers:
-            KmctlTest.servers.end_below(folder)
+            KmctlTest.servers.end_below("")
             if not KmctlTest.servers.ended_well:
                 sys.exit("a server did not end as it should")
         sys.exit(not result.wasSuccessful())

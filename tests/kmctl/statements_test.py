@@ -27,6 +27,8 @@ class Device(KmctlTest):
     def setUpClass(cls):
         folder = tempfile.TemporaryDirectory(prefix="kmctl-attested-")
         cls.addClassCleanup(folder.cleanup)
+        if cls.servers:
+            cls.addClassCleanup(cls.servers.end_below, folder.name)
         cls.device_folder = folder.name
 
     def setUp(self):
