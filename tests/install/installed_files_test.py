@@ -20,12 +20,12 @@ PROTOTYPE = re.compile(r"^(?:TEEC_Result|void) (TEEC_\w+)\(", re.MULTILINE)
 
 
 class InstalledFiles(InstalledTest):
-    def library(self, name):
+    def installed_library(self, name):
         return next(self.prefix.glob(f"lib*/**/{name}"))
 
     def exports(self, name):
         """The demangled names that a library defines, each with the version it has."""
-        lines = run("nm", "-DC", "--defined-only", self.library(name)).stdout.splitlines()
+        lines = run("nm", "-DC", "--defined-only", self.installed_library(name)).stdout.splitlines()
         names = [re.sub(r"^\S* ?\S ", "", line.strip()) for line in lines]
         return [name.rpartition("@@")[::2] for name in names if "@@" in name]
 
@@ -95,7 +95,7 @@ class InstalledFiles(InstalledTest):
 
     def test_every_library_has_its_name_and_a_version(self):
         for name, version in LIBRARIES.items():
-            told = run("readelf", "-dV", "-W", self.library(name)).stdout
+            told = run("readelf", "-dV", "-W", self.installed_library(name)).stdout
             self.assertRegex(told, rf"Library soname: \[{re.escape(name)}\]")
             self.assertIn(f"Name: {version}", told)
             self.assertNotRegex(told, r"TEXTREL")
@@ -118,7 +118,7 @@ class InstalledFiles(InstalledTest):
                     "-I", self.prefix / "include", program)
 
     def test_a_program_that_loads_the_library_as_a_plug_in_reaches_the_ta(self):
-        library = self.library("libtee_client_api.so.0")
+        library = self.installed_library("libtee_client_api.so.0")
         told = run(sys.executable, "-B", pathlib.Path(__file__).with_name("plug_in.py"), library, self.tee)
         self.assertEqual(told.stdout, "the TA has 4 algorithms\n")
 

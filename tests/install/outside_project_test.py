@@ -28,7 +28,7 @@ class OutsideProject(InstalledTest):
         folder = next(self.prefix.glob("lib*/**/pkgconfig"))
         return shlex.split(run("pkg-config", "--cflags", "--libs", package, PKG_CONFIG_PATH=str(folder)).stdout)
 
-    def library_folder(self):
+    def folder_of_libraries(self):
         return str(next(self.prefix.glob("lib*/**/libtee_client_api.so")).parent)
 
     def assert_signs(self, program, **environment):
@@ -58,7 +58,7 @@ class OutsideProject(InstalledTest):
         program = self.folder / "first_client"
         run("cc", "-std=c11", "-Wall", "-Wextra", "-Wpedantic", "-Werror", self.source / "example/first_client.c",
             *self.flags("keymaster-tee-client"), "-o", program)
-        self.assert_signs(program, LD_LIBRARY_PATH=self.library_folder())
+        self.assert_signs(program, LD_LIBRARY_PATH=self.folder_of_libraries())
 
     def test_a_program_in_cxx_builds_with_cmake(self):
         self.assert_outside_works(self.build_with_cmake(OUTSIDE) / "outside")
@@ -67,7 +67,7 @@ class OutsideProject(InstalledTest):
         program = self.folder / "outside"
         run("c++", "-std=c++20", "-Wall", "-Wextra", "-Werror", OUTSIDE / "outside.cpp",
             *self.flags("keymaster-client"), "-o", program)
-        self.assert_outside_works(program, LD_LIBRARY_PATH=self.library_folder())
+        self.assert_outside_works(program, LD_LIBRARY_PATH=self.folder_of_libraries())
 
     def test_another_version_than_the_installed_one_is_refused(self):
         project = self.folder / "asking"
