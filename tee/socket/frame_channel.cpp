@@ -31,6 +31,10 @@ void tell_put() {}
 void tell_taken() {}
 #endif
 
+// The longest of the usual commands is a signature with an RSA key, of a good half of a millisecond. To be woken after
+// it would cost the client a tenth of that again.
+constexpr auto until_answered = std::chrono::milliseconds(1);
+
 // A look at the socket is a system call, and costs as much as many at a slot.
 constexpr unsigned looks_at_the_slot = 32;
 
@@ -47,6 +51,7 @@ void frame_channel::use_slots(mapped_memory memory, slot_layout layout, side min
   const frame_slot answers(&all[slot_layout::answer_word],
                            all.subspan(slot_layout::first_room + layout.longest, layout.longest));
   const bool asks = mine == side::asks;
+  if (asks) waiting_ = patience(until_answered);
   memory_.emplace(slots{std::move(memory), asks ? answers : requests, asks ? requests : answers});
 }
 

@@ -38,7 +38,8 @@ class frame_channel {
 
   enum class side { asks, answers };
 
-  /// use_slots takes the memory, of a layout's size, that both sides have mapped.
+  /// use_slots takes the memory, of a layout's size, that both sides have mapped. From then on the side that asks
+  /// watches for as long as usual commands take.
   void use_slots(mapped_memory memory, slot_layout layout, side mine);
   [[nodiscard]] bool has_slots() const { return memory_.has_value(); }
 
@@ -63,7 +64,7 @@ class frame_channel {
 
   file_descriptor socket_;
   std::optional<slots> memory_;
-  patience waiting_{std::chrono::microseconds(50)};  // as long as most commands take, and as a client between two
+  patience waiting_{std::chrono::microseconds(50)};  // as long as a client rests between two commands
 };
 
 }  // namespace hosted_tee
