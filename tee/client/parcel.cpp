@@ -23,10 +23,6 @@ void copy(std::uint8_t* to, const std::uint8_t* from, std::size_t size) {
   if (size != 0) std::memcpy(to, from, size);
 }
 
-[[noreturn]] void disbelieve() {
-  throw client_failure(TEEC_ERROR_COMMUNICATION, TEEC_ORIGIN_COMMS);
-}
-
 }  // namespace
 
 parcel::parcel(client_params& params, const std::function<known_memory&(std::size_t)>& staging) : params_(params) {
@@ -104,22 +100,28 @@ void parcel::stage(std::size_t slot, known_memory& memory, std::size_t& used) {
   used += static_cast<std::size_t>(aligned(given.size));
 }
 
+bool parcel::is_answered_by(const remote::answer_slots& answer) const {
+  if (answer.types != slots_.types) return false;
+  for (std::size_t i = 0; i < 4; ++i) {
+    if (slots_.slots[i].source != remote::memory_source::carried) continue;
+    const std::size_t room = std::min(answer.slots[i].size, slots_.slots[i].size);
+    if (answer.slots[i].data.size() > room) return false;
+  }
+  return true;
+}
+
 // Unless the TA was reached there is nothing in the shared memory but what an earlier operation left.
 void parcel::unpack_memory(std::size_t slot, const remote::answer_slot& answer, bool reached_ta) {
   auto& given = params_.slots()[slot].memref;
-  const std::size_t room = given.size;
-  const std::size_t written = std::min<std::size_t>(answer.size, room);
   if (slots_.slots[slot].source == remote::memory_source::carried) {
-    if (answer.data.size() > written) disbelieve();
     copy(static_cast<std::uint8_t*>(given.buffer), answer.data.data(), answer.data.size());
   } else if (reached_ta && copies_[slot].own != nullptr) {
-    copy(copies_[slot].own, copies_[slot].shared.data(), written);
+    copy(copies_[slot].own, copies_[slot].shared.data(), std::min<std::size_t>(answer.size, given.size));
   }
   given.size = answer.size;
 }
 
 void parcel::unpack(const remote::outcome& done, const remote::answer_slots& answer) {
-  if (answer.types != slots_.types) disbelieve();
   if (done.origin == TEEC_ORIGIN_COMMS) return;
   for (std::size_t i = 0; i < 4; ++i) {
     const std::uint32_t type = TEE_PARAM_TYPE_GET(slots_.types, i);

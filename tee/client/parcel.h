@@ -24,8 +24,11 @@ class parcel {
 
   [[nodiscard]] const remote::request_slots& slots() const { return slots_; }
 
-  /// unpack puts values, sizes and memory where they belong; what the server refused stays as it was. Throws
-  /// client_failure with TEEC_ERROR_COMMUNICATION for an answer that does not belong to the request.
+  /// is_answered_by tells whether the answer has the request's parameters, and no more memory than they have room for.
+  [[nodiscard]] bool is_answered_by(const remote::answer_slots& answer) const;
+
+  /// unpack puts values, sizes and memory where they belong; what the server refused stays as it was. For answers that
+  /// belong to the request.
   void unpack(const remote::outcome& done, const remote::answer_slots& answer);
 
  private:

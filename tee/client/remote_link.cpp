@@ -87,6 +87,7 @@ TEEC_Result remote_link::open_session(const TEE_UUID& ta, std::uint32_t method, 
   parcel sent(params, [this](std::size_t size) -> known_memory& { return staging(size); });
   remote::open_answer answer;
   channel_.ask(frame_kind::open_session, remote::open_request{to_bytes(ta), method, group, sent.slots()}, answer);
+  if (!sent.is_answered_by(answer.params)) channel_.break_off();
   origin = answer.done.origin;
   session = answer.session;
   sent.unpack(answer.done, answer.params);
@@ -100,6 +101,7 @@ TEEC_Result remote_link::invoke(std::uint32_t session, std::uint32_t command, cl
   parcel sent(params, [this](std::size_t size) -> known_memory& { return staging(size); });
   remote::invoke_answer answer;
   channel_.ask(frame_kind::invoke, remote::invoke_request{session, command, sent.slots()}, answer);
+  if (!sent.is_answered_by(answer.params)) channel_.break_off();
   origin = answer.done.origin;
   sent.unpack(answer.done, answer.params);
   tidy_staging();

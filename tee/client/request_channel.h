@@ -36,12 +36,14 @@ class request_channel {
     if (!remote::read_body(exchange(builder.finish(), kind, passed), answer)) break_off();
   }
 
+  /// break_off is for an answer that can't be one to the request: TEEC_ERROR_COMMUNICATION.
+  [[noreturn]] void break_off();
+
   /// wait_for_end waits until the server has closed the connection.
   void wait_for_end();
 
  private:
   std::span<const std::uint8_t> exchange(std::span<const std::uint8_t> request, remote::frame_kind kind, int passed);
-  [[noreturn]] void break_off();
   [[noreturn]] void explain_refusal(const remote::frame& refused);
 
   void make_slots();

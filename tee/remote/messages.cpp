@@ -3,82 +3,12 @@
 
 #include <algorithm>
 #include <concepts>
-#include <string_view>
 #include <type_traits>
+
+#include "tee/remote/fields.h"
 
 namespace hosted_tee::remote {
 namespace {
-
-/// Reads fields, and remembers whether all were there.
-class field_reader {
- public:
-  explicit field_reader(std::span<const std::uint8_t> body) : in_(body) {}
-
-  template <class Number>
-  void number(Number& value) {
-    ok_ = ok_ && in_.number(value);
-  }
-  void octets(std::array<std::uint8_t, 16>& value) {
-    std::span<const std::uint8_t> data;
-    ok_ = ok_ && in_.bytes(value.size(), data);
-    if (ok_) std::copy(data.begin(), data.end(), value.begin());
-  }
-  void text(std::string& value) {
-    std::uint32_t length = 0;
-    std::span<const std::uint8_t> data;
-    number(length);
-    ok_ = ok_ && length <= longest_text && in_.bytes(length, data);
-    if (ok_) value.assign(data.begin(), data.end());
-  }
-  template <class Slots>
-  void slots(Slots& value) {
-    ok_ = ok_ && read(in_, value);
-  }
-  /// Entries are made as they are found: a count alone must not cost memory.
-  template <class Entry, class Fields>
-  void list(std::vector<Entry>& entries, Fields&& fields) {
-    std::uint32_t count = 0;
-    number(count);
-    entries.clear();
-    for (std::uint32_t i = 0; i < count && ok_; ++i) fields(*this, entries.emplace_back());
-  }
-
-  [[nodiscard]] bool is_whole() const { return ok_ && in_.at_end(); }
-  void require(bool holds) { ok_ = ok_ && holds; }
-
- private:
-  frame_reader in_;
-  bool ok_ = true;
-};
-
-class field_writer {
- public:
-  explicit field_writer(frame_writer& out) : out_(out) {}
-
-  template <class Number>
-  void number(const Number& value) {
-    out_.number(value);
-  }
-  void octets(const std::array<std::uint8_t, 16>& value) { out_.bytes(value); }
-  void text(const std::string& value) {
-    const std::string_view told = std::string_view(value).substr(0, longest_text);
-    out_.number(static_cast<std::uint32_t>(told.size()));
-    out_.bytes({reinterpret_cast<const std::uint8_t*>(told.data()), told.size()});
-  }
-  template <class Slots>
-  void slots(const Slots& value) {
-    write(out_, value);
-  }
-  template <class Entry, class Fields>
-  void list(const std::vector<Entry>& entries, Fields&& fields) {
-    out_.number(static_cast<std::uint32_t>(entries.size()));
-    for (const Entry& entry : entries) fields(*this, entry);
-  }
-  void require(bool /*holds*/) {}
-
- private:
-  frame_writer& out_;
-};
 
 // `Message` is const on the way out.
 template <class T, class Like>
@@ -225,125 +155,52 @@ void fields(Io& io, T& m) {
   io.list(m.lines, [](auto& inner, auto& entry) { fields(inner, entry); });
 }
 
+}  // namespace
+
 template <class Message>
-bool read_whole(std::span<const std::uint8_t> body, Message& message) {
+bool read_body(std::span<const std::uint8_t> body, Message& message) {
   field_reader io(body);
   fields(io, message);
   return io.is_whole();
 }
 
 template <class Message>
-void write_whole(frame_writer& out, const Message& message) {
+void write_body(frame_writer& out, const Message& message) {
   field_writer io(out);
   fields(io, message);
 }
 
-}  // namespace
+template bool read_body(std::span<const std::uint8_t>, empty_request&);
+template bool read_body(std::span<const std::uint8_t>, plain_answer&);
+template bool read_body(std::span<const std::uint8_t>, refusal_answer&);
+template bool read_body(std::span<const std::uint8_t>, hello_answer&);
+template bool read_body(std::span<const std::uint8_t>, open_request&);
+template bool read_body(std::span<const std::uint8_t>, open_answer&);
+template bool read_body(std::span<const std::uint8_t>, invoke_request&);
+template bool read_body(std::span<const std::uint8_t>, invoke_answer&);
+template bool read_body(std::span<const std::uint8_t>, close_request&);
+template bool read_body(std::span<const std::uint8_t>, share_request&);
+template bool read_body(std::span<const std::uint8_t>, share_answer&);
+template bool read_body(std::span<const std::uint8_t>, release_request&);
+template bool read_body(std::span<const std::uint8_t>, status_answer&);
+template bool read_body(std::span<const std::uint8_t>, log_request&);
+template bool read_body(std::span<const std::uint8_t>, log_answer&);
 
-bool read_body(std::span<const std::uint8_t> body, empty_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const empty_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, plain_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const plain_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, refusal_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const refusal_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, hello_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const hello_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, open_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const open_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, open_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const open_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, invoke_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const invoke_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, invoke_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const invoke_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, close_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const close_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, share_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const share_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, share_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const share_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, release_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const release_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, status_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const status_answer& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, log_request& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const log_request& message) {
-  write_whole(out, message);
-}
-
-bool read_body(std::span<const std::uint8_t> body, log_answer& message) {
-  return read_whole(body, message);
-}
-void write_body(frame_writer& out, const log_answer& message) {
-  write_whole(out, message);
-}
+template void write_body(frame_writer&, const empty_request&);
+template void write_body(frame_writer&, const plain_answer&);
+template void write_body(frame_writer&, const refusal_answer&);
+template void write_body(frame_writer&, const hello_answer&);
+template void write_body(frame_writer&, const open_request&);
+template void write_body(frame_writer&, const open_answer&);
+template void write_body(frame_writer&, const invoke_request&);
+template void write_body(frame_writer&, const invoke_answer&);
+template void write_body(frame_writer&, const close_request&);
+template void write_body(frame_writer&, const share_request&);
+template void write_body(frame_writer&, const share_answer&);
+template void write_body(frame_writer&, const release_request&);
+template void write_body(frame_writer&, const status_answer&);
+template void write_body(frame_writer&, const log_request&);
+template void write_body(frame_writer&, const log_answer&);
 
 std::size_t log_line_size(const log_line& line) {
   constexpr std::size_t numbers = 8 + 4 + 4;

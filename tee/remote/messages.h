@@ -121,37 +121,11 @@ struct log_answer {
   std::vector<log_line> lines;
 };
 
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, empty_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, plain_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, refusal_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, hello_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, open_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, open_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, invoke_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, invoke_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, close_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, share_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, share_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, release_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, status_answer& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, log_request& message);
-[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, log_answer& message);
-
-void write_body(frame_writer& out, const empty_request& message);
-void write_body(frame_writer& out, const plain_answer& message);
-void write_body(frame_writer& out, const refusal_answer& message);
-void write_body(frame_writer& out, const hello_answer& message);
-void write_body(frame_writer& out, const open_request& message);
-void write_body(frame_writer& out, const open_answer& message);
-void write_body(frame_writer& out, const invoke_request& message);
-void write_body(frame_writer& out, const invoke_answer& message);
-void write_body(frame_writer& out, const close_request& message);
-void write_body(frame_writer& out, const share_request& message);
-void write_body(frame_writer& out, const share_answer& message);
-void write_body(frame_writer& out, const release_request& message);
-void write_body(frame_writer& out, const status_answer& message);
-void write_body(frame_writer& out, const log_request& message);
-void write_body(frame_writer& out, const log_answer& message);
+/// Both are there for each of the records above that is a body.
+template <class Message>
+[[nodiscard]] bool read_body(std::span<const std::uint8_t> body, Message& message);
+template <class Message>
+void write_body(frame_writer& out, const Message& message);
 
 /// log_line_size is what a line takes in an answer.
 [[nodiscard]] std::size_t log_line_size(const log_line& line);

@@ -4,6 +4,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
+
 #include "tests/remote/server_fixture.h"
 
 namespace hosted_tee::testing {
@@ -132,13 +134,19 @@ TEST_F(ServerGoneTest, AnAnswerThatDoesNotBelongToTheRequestEndsTheConnection) {
       [&](const remote::frame& r) { return raw_frame(std::uint16_t{0x8002}, body_of(other_types), r.header.sequence); },
   });
   for (std::size_t i = 0; i < answers.size(); ++i) {
-    false_server liar(path());
-    liar.run(answers[i]);
-    ASSERT_EQ(initialize(), TEEC_SUCCESS);
-    EXPECT_EQ(open(), TEEC_ERROR_COMMUNICATION) << i;
-    EXPECT_EQ(origin, TEEC_ORIGIN_COMMS);
-    EXPECT_EQ(session.imp, nullptr);
-    TEEC_FinalizeContext(&context);
+    std::atomic<int> asked = 0;
+    {
+      false_server liar(path());
+      liar.run([&](const remote::frame& request) { return ++asked, answers[i](request); });
+      ASSERT_EQ(initialize(), TEEC_SUCCESS);
+      for (int again = 0; again < 2; ++again) {
+        EXPECT_EQ(open(), TEEC_ERROR_COMMUNICATION) << i;
+        EXPECT_EQ(origin, TEEC_ORIGIN_COMMS);
+        EXPECT_EQ(session.imp, nullptr);
+      }
+      TEEC_FinalizeContext(&context);
+    }
+    EXPECT_EQ(asked, 1) << i;
   }
 }
 
@@ -161,7 +169,9 @@ TEST_F(ServerGoneTest, MoreMemoryThanTheRequestHadRoomForIsNotTaken) {
   operation.paramTypes = TEEC_MEMREF_TEMP_OUTPUT;
   operation.params[0].tmpref = {room.data(), 8};
   EXPECT_EQ(TEEC_InvokeCommand(&session, 5, &operation, &origin), TEEC_ERROR_COMMUNICATION);
+  EXPECT_EQ(origin, TEEC_ORIGIN_COMMS);
   EXPECT_EQ(room, bytes(16, 0xA5));
+  EXPECT_EQ(operation.params[0].tmpref.size, 8U);
   TEEC_CloseSession(&session);
   TEEC_FinalizeContext(&context);
 }
