@@ -2,6 +2,7 @@
 
 #include <fmt/format.h>
 
+#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <array>
 #include <cstdlib>
@@ -9,6 +10,7 @@
 #include <sstream>
 #include <string_view>
 
+#include "client/kmctl/command_line.h"
 #include "client/kmctl/commands.h"
 #include "client/kmctl/console.h"
 #include "client/kmctl/exit_codes.h"
@@ -54,20 +56,21 @@ constexpr const char* environment_help =
     "  KEYMASTER_TRACE    error, info or debug: the secure world's trace on standard error, as --trace\n"
     "  KEYMASTER_TA_PATH  the folder of the TA images\n";
 
-void add_global_options(CLI::App& app, context& ctx) {
-  auto* const tee =
-      app.add_option("--tee", ctx.tee, "the TEE to use: embedded:FOLDER, or unix:PATH for a server")->type_name("NAME");
-  app.add_option("--state", ctx.state, "folder of the device's state; a blob opens only with the state that sealed it")
-      ->type_name("FOLDER")
-      ->excludes(tee);
-  app.add_flag("--json", ctx.json_output,
-               "print results and errors as JSON: to standard output, or to standard error when data goes there");
-  app.add_option_function<std::string>(
-         "--trace", [](const std::string& level) { ::setenv("KEYMASTER_TRACE", level.c_str(), 1); },
-         "print the secure world's trace on standard error: error, info or debug")
-      ->check(CLI::IsMember({"error", "info", "debug"}))
-      ->type_name("LEVEL");
-  app.set_version_flag("--version", "kmctl " KEYMASTER_VERSION, "print the version");
+void add_global_options(command_line& command, context& ctx) {
+  const option tee = command.add_option("--tee", ctx.tee, "the TEE to use: embedded:FOLDER, or unix:PATH for a server")
+                         .type_name("NAME");
+  command
+      .add_option("--state", ctx.state, "folder of the device's state; a blob opens only with the state that sealed it")
+      .type_name("FOLDER")
+      .excludes(tee);
+  command.add_flag("--json", ctx.json_output,
+                   "print results and errors as JSON: to standard output, or to standard error when data goes there");
+  command
+      .add_option_function(
+          "--trace", [](const std::string& level) { ::setenv("KEYMASTER_TRACE", level.c_str(), 1); },
+          "print the secure world's trace on standard error: error, info or debug")
+      .one_of({"error", "info", "debug"})
+      .type_name("LEVEL");
 }
 
 /// What parsing could not read yet, an error of the command line itself must still obey.
@@ -109,12 +112,11 @@ int parse_and_run(CLI::App& app, int argc, const char* const* argv, const contex
 
 }  // namespace
 
-void define_group(CLI::App& group, context& ctx, std::span<const command_row> commands) {
-  group.require_subcommand(1);
+void define_group(command_line& group, context& ctx, std::span<const command_row> commands) {
+  group.require_subcommand();
   for (const command_row& row : commands) {
-    CLI::App* const command = group.add_subcommand(row.name, row.description);
-    command->fallthrough();  // so that --json and its like may also stand behind the sub-command
-    row.define(*command, ctx);
+    command_line command = group.add_subcommand(row.name, row.description);
+    row.define(command, ctx);
   }
 }
 
@@ -122,8 +124,10 @@ std::unique_ptr<CLI::App> make_application(context& ctx) {
   auto app = std::make_unique<CLI::App>(description, "kmctl");
   app->footer(std::string(environment_help) + "\n" + exit_code_help);
   app->option_defaults()->always_capture_default(false);
-  add_global_options(*app, ctx);
-  define_group(*app, ctx, command_rows);
+  command_line whole(*app);
+  add_global_options(whole, ctx);
+  app->set_version_flag("--version", "kmctl " KEYMASTER_VERSION, "print the version");
+  define_group(whole, ctx, command_rows);
   return app;
 }
 

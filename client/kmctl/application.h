@@ -2,10 +2,13 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_APPLICATION_H_
 #define KEYMASTER_CLIENT_KMCTL_APPLICATION_H_
 
-#include <CLI/CLI.hpp>
 #include <memory>
 
 #include "client/kmctl/context.h"
+
+namespace CLI {
+class App;
+}
 
 namespace kmctl {
 

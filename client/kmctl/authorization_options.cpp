@@ -151,15 +151,15 @@ void add_values(authorizations& out, const option_row& row, std::string_view tex
   add_value(out, row, std::string(text));
 }
 
-void add_row(CLI::App& command, const option_row& row, authorizations& out, std::vector<std::string>& files) {
+void add_row(command_line& command, const option_row& row, authorizations& out, std::vector<std::string>& files) {
   if (row.kind == value_kind::flag) {
     command
         .add_flag_callback(
             row.flag, [&row, &out] { add_value(out, row, {}); }, row.help)
-        ->group(row.group);
+        .group(row.group);
     return;
   }
-  auto* const option = command.add_option_function<std::string>(
+  const option made = command.add_option_function(
       row.flag,
       [&row, &out, &files](const std::string& text) {
         if (row.kind == value_kind::file) {
@@ -168,9 +168,9 @@ void add_row(CLI::App& command, const option_row& row, authorizations& out, std:
         add_values(out, row, text);
       },
       help_of(row));
-  option->type_name(placeholder(row.kind))->group(row.group);
+  made.type_name(placeholder(row.kind)).group(row.group);
   if (is_list(row.kind)) {
-    option->join(',');  // an option that is given again goes on with its list
+    made.join(',');  // an option that is given again goes on with its list
   }
 }
 
@@ -260,7 +260,7 @@ void add_missing(authorizations& to, const authorizations& given, const authoriz
 
 }  // namespace
 
-void authorization_options::add_to(CLI::App& command, option_use use) {
+void authorization_options::add_to(command_line& command, option_use use) {
   for (const option_row& row : option_rows) {
     if ((row.uses & static_cast<unsigned>(use)) != 0) {
       add_row(command, row, given_, files_);
@@ -268,11 +268,11 @@ void authorization_options::add_to(CLI::App& command, option_use use) {
   }
 }
 
-void application_options::add_to(CLI::App& command) {
+void application_options::add_to(command_line& command) {
   constexpr const char* group = "Application";
   const auto add = [&](const char* flag, bytes& to, const char* help) {
     command
-        .add_option_function<std::string>(
+        .add_option_function(
             flag,
             [this, &to](const std::string& text) {
               if (const auto file = file_of_value(text)) {
@@ -281,8 +281,8 @@ void application_options::add_to(CLI::App& command) {
               to = parse_bytes(text);
             },
             help)
-        ->type_name("VALUE")
-        ->group(group);
+        .type_name("VALUE")
+        .group(group);
   };
   add("--app-id", given_.id, "application id the key is bound to: text, hex:00ff17 or @FILE");
   add("--app-data", given_.data, "application data the key is bound to, in the same forms");

@@ -2,10 +2,10 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_AUTHORIZATION_OPTIONS_H_
 #define KEYMASTER_CLIENT_KMCTL_AUTHORIZATION_OPTIONS_H_
 
-#include <CLI/CLI.hpp>
 #include <string>
 #include <vector>
 
+#include "client/kmctl/command_line.h"
 #include "client/lib/authorizations.h"
 #include "client/lib/keys.h"
 
@@ -18,7 +18,7 @@ enum class option_use : unsigned { generate = 1, import = 2, operation = 4, ciph
 class authorization_options {
  public:
   /// add_to offers the options for `use` on a sub-command. This object must live as long as the sub-command.
-  void add_to(CLI::App& command, option_use use);
+  void add_to(command_line& command, option_use use);
 
   /// What was given, in the order of the options' table.
   [[nodiscard]] const keymaster::client::authorizations& given() const { return given_; }
@@ -33,7 +33,7 @@ class authorization_options {
 /// Collects --app-id and --app-data.
 class application_options {
  public:
-  void add_to(CLI::App& command);
+  void add_to(command_line& command);
   [[nodiscard]] const keymaster::client::application& given() const { return given_; }
   /// The files that it came from.
   [[nodiscard]] const std::vector<std::string>& files() const { return files_; }

@@ -34,7 +34,7 @@ constexpr const char* device_id_examples =
     "  kmctl attest device-id --json | jq -r .device_id\n";
 
 struct status_options {
-  void add_to(CLI::App& command) { command.footer(status_examples); }
+  void add_to(command_line& command) { command.footer(status_examples); }
 };
 
 const char* word_of(client::attk_status status) {
@@ -60,11 +60,11 @@ int run_status(const status_options& /*options*/, const context& ctx) {
 
 struct export_options {
   std::string out = "-";
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     data_option = command.add_option("-o,--output", out, "file for the public key (default: standard output)");
-    data_option->type_name("FILE");
+    data_option.type_name("FILE");
     command.footer(export_examples);
   }
 };
@@ -82,7 +82,7 @@ int run_export(const export_options& options, const context& ctx) {
 }
 
 struct device_id_options {
-  void add_to(CLI::App& command) { command.footer(device_id_examples); }
+  void add_to(command_line& command) { command.footer(device_id_examples); }
 };
 
 int run_device_id(const device_id_options& /*options*/, const context& ctx) {
@@ -100,7 +100,7 @@ constexpr std::array commands = std::to_array<command_row>({
 
 }  // namespace
 
-void define_attest(CLI::App& group, context& ctx) {
+void define_attest(command_line& group, context& ctx) {
   define_group(group, ctx, commands);
 }
 

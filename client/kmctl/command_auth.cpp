@@ -45,8 +45,8 @@ std::string question(const char* kind, std::uint32_t uid) {
   return fmt::format("{} of user {}: ", kind, uid);
 }
 
-CLI::Option* add_uid(CLI::App& command, std::uint32_t& uid) {
-  return add_number(command, "--uid", uid, "the user's number")->required();
+option add_uid(command_line& command, std::uint32_t& uid) {
+  return add_number(command, "--uid", uid, "the user's number").required();
 }
 
 struct enrol_options {
@@ -57,19 +57,19 @@ struct enrol_options {
   waiting_option waiting;
   std::string out;
   bool force = false;
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     add_uid(command, uid);
     password.add_to(command, "--password-file", "file with the password, - for standard input (default: it is asked)");
-    auto* const handle =
+    const option handle =
         command.add_option("--present-handle", present_handle, "the handle of the password that is to be replaced");
-    handle->type_name("FILE");
+    handle.type_name("FILE");
     present_password.add_to(command, "--present-password-file", "file with that password (default: it is asked)")
-        ->needs(handle);
+        .needs(handle);
     waiting.add_to(command);
     data_option = command.add_option("-o,--output", out, "file for the handle, - for standard output");
-    data_option->type_name("FILE")->required();
+    data_option.type_name("FILE").required();
     command.add_flag("--force", force, "overwrite an existing file");
     command.footer(enrol_examples);
   }
@@ -114,16 +114,16 @@ struct token_options {
   std::uint64_t challenge = 0;
   waiting_option waiting;
   std::string out = "-";
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     add_uid(command, uid);
     password.add_to(command, "--password-file", "file with the password, - for standard input (default: it is asked)");
-    command.add_option("HANDLE", handle, "the password's handle, - for standard input")->required()->type_name("");
+    command.add_option("HANDLE", handle, "the password's handle, - for standard input").required().type_name("");
     add_number(command, "--challenge", challenge, "the operation that the token is for (default: 0, none)");
     waiting.add_to(command);
     data_option = command.add_option("-o,--output", out, "file for the auth token (default: standard output)");
-    data_option->type_name("FILE");
+    data_option.type_name("FILE");
     command.footer(token_examples);
   }
 };
@@ -152,7 +152,7 @@ constexpr std::array commands = std::to_array<command_row>({
 
 }  // namespace
 
-void define_auth(CLI::App& group, context& ctx) {
+void define_auth(command_line& group, context& ctx) {
   define_group(group, ctx, commands);
 }
 

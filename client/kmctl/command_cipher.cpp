@@ -61,27 +61,27 @@ struct cipher_options {
   std::optional<bytes> nonce;
   std::optional<bytes> associated_data;
   bool raw = false;
-  CLI::Option* data_option = nullptr;
+  option data_option;
   std::vector<std::string> value_files;  ///< the FILEs of values that are @FILE
 
   static constexpr const char* group = "Nonce and associated data";
 
-  void add_options(CLI::App& command, const char* file_help, const char* out_help, const char* nonce_help,
+  void add_options(command_line& command, const char* file_help, const char* out_help, const char* nonce_help,
                    const char* raw_help) {
-    command.add_option("BLOB", blob, "sealed key, - for standard input")->required()->type_name("");
-    command.add_option("FILE", file, file_help)->type_name("");
+    command.add_option("BLOB", blob, "sealed key, - for standard input").required().type_name("");
+    command.add_option("FILE", file, file_help).type_name("");
     data_option = command.add_option("-o,--output", out, out_help);
-    data_option->type_name("FILE");
+    data_option.type_name("FILE");
     parameters.add_to(command, option_use::cipher);
     add_bytes(command, "--aad", associated_data, parse_bytes,
               "associated data that gcm authenticates with the text: text, hex:00ff17 or @FILE");
     add_bytes(command, "--nonce", nonce, parse_nonce, nonce_help);
-    command.add_flag("--raw", raw, raw_help)->group(group);
+    command.add_flag("--raw", raw, raw_help).group(group);
     presence.add_to(command);
     app.add_to(command);
   }
 
-  void add_bytes(CLI::App& command, const char* flag, std::optional<bytes>& to, bytes (*parse)(const std::string&),
+  void add_bytes(command_line& command, const char* flag, std::optional<bytes>& to, bytes (*parse)(const std::string&),
                  const char* help) {
     const auto take = [this, &to, parse](const std::string& text) {
       if (const auto file_name = file_of_value(text)) {
@@ -89,7 +89,7 @@ struct cipher_options {
       }
       to = parse(text);
     };
-    command.add_option_function<std::string>(flag, take, help)->type_name("VALUE")->group(group);
+    command.add_option_function(flag, take, help).type_name("VALUE").group(group);
   }
 
   [[nodiscard]] std::vector<std::string> inputs() const {
@@ -104,20 +104,20 @@ struct cipher_options {
 struct encrypt_options : cipher_options {
   std::string nonce_out;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     add_options(command, "the text, - for standard input (the default)",
                 "file for the ciphertext (default: standard output)",
                 "the nonce to use, if the key allows that: hexadecimal digits or @FILE",
                 "no nonce in front of the ciphertext; needs --nonce or --nonce-out");
     command.add_option("--nonce-out", nonce_out, "write the nonce there and not in front of the ciphertext")
-        ->type_name("FILE")
-        ->group(group);
+        .type_name("FILE")
+        .group(group);
     command.footer(encrypt_examples);
   }
 };
 
 struct decrypt_options : cipher_options {
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     add_options(command, "the ciphertext, - for standard input (the default)",
                 "file for the text (default: standard output)",
                 "the nonce of a ciphertext that has none in front: hexadecimal digits or @FILE",
@@ -291,11 +291,11 @@ int run_decrypt(const decrypt_options& options, const context& ctx) {
 
 }  // namespace
 
-void define_encrypt(CLI::App& command, context& ctx) {
+void define_encrypt(command_line& command, context& ctx) {
   define<encrypt_options>(command, ctx, run_encrypt);
 }
 
-void define_decrypt(CLI::App& command, context& ctx) {
+void define_decrypt(command_line& command, context& ctx) {
   define<decrypt_options>(command, ctx, run_decrypt);
 }
 

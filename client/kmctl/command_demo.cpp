@@ -37,11 +37,11 @@ struct demo_options {
   std::string folder;
   bool force = false;
 
-  void add_to(CLI::App& command) {
-    command.add_option("FILE", file, "file to work on (default: this program)")->type_name("");
+  void add_to(command_line& command) {
+    command.add_option("FILE", file, "file to work on (default: this program)").type_name("");
     command
         .add_option("-o,--output", folder, "folder for keys, signatures and ciphertexts (default: a new one in /tmp)")
-        ->type_name("FOLDER");
+        .type_name("FOLDER");
     command.add_flag("--force", force, "overwrite what an earlier demo left in the folder");
     command.footer(examples);
   }
@@ -78,9 +78,9 @@ int run_demo(const demo_options& options, const context& ctx) {
   for (void (*const show)(demonstration&) : rounds) {
     show(demo);
   }
-  const std::string repeat = command_line(verify_command(demo.path("public.pem"), demo.path("signature.bin"), file));
+  const std::string repeat = shell_words(verify_command(demo.path("public.pem"), demo.path("signature.bin"), file));
   const std::string inspect =
-      command_line({"openssl", "pkey", "-pubin", "-in", demo.path("public.pem"), "-text", "-noout"});
+      shell_words({"openssl", "pkey", "-pubin", "-in", demo.path("public.pem"), "-text", "-noout"});
   demo.say(fmt::format("\nEverything came out as it must. To check it yourself:\n  {}\n  {}", repeat, inspect));
   if (ctx.json_output) {
     tell(ctx, {},
@@ -97,7 +97,7 @@ int run_demo(const demo_options& options, const context& ctx) {
 
 }  // namespace
 
-void define_demo(CLI::App& command, context& ctx) {
+void define_demo(command_line& command, context& ctx) {
   define<demo_options>(command, ctx, run_demo);
 }
 

@@ -41,12 +41,12 @@ struct provision_options {
   std::optional<std::string> record;
   bool lock = false;
   bool force = false;
-  CLI::Option* extra_data_option = nullptr;
+  option extra_data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     plan.add_to(command);
     extra_data_option = command.add_option("--record", record, "file for the factory record, - for standard output");
-    extra_data_option->type_name("FILE");
+    extra_data_option.type_name("FILE");
     command.add_flag("--lock", lock, "lock the device at the end, for ever");
     command.add_flag("--force", force, "replace an attestation key that is there, and an existing record");
     command.footer(provision_examples);
@@ -142,7 +142,7 @@ int run_provision(const provision_options& options, const context& ctx) {
 }
 
 struct status_options {
-  void add_to(CLI::App& command) { command.footer(status_examples); }
+  void add_to(command_line& command) { command.footer(status_examples); }
 };
 
 struct status_row {
@@ -180,7 +180,7 @@ constexpr std::array commands = std::to_array<command_row>({
 
 }  // namespace
 
-void define_device(CLI::App& group, context& ctx) {
+void define_device(command_line& group, context& ctx) {
   define_group(group, ctx, commands);
 }
 

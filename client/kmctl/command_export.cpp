@@ -56,8 +56,8 @@ struct sealed_key {
   std::string path;
   application_options app;
 
-  void add_to(CLI::App& command) {
-    command.add_option("BLOB", path, "sealed key, - for standard input")->required()->type_name("");
+  void add_to(command_line& command) {
+    command.add_option("BLOB", path, "sealed key, - for standard input").required().type_name("");
     app.add_to(command);
   }
   [[nodiscard]] bytes read() const { return read_small_file(path, "key blob"); }
@@ -68,14 +68,14 @@ struct export_options {
   std::string out = "-";
   bool der = false;
   bool statement = false;
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     key.add_to(command);
     data_option = command.add_option("-o,--output", out, "file for the public key (default: standard output)");
-    data_option->type_name("FILE");
-    auto* const der_flag = command.add_flag("--der", der, "DER in place of PEM");
-    command.add_flag("--statement", statement, "the signed statement of an attested key")->excludes(der_flag);
+    data_option.type_name("FILE");
+    const option der_flag = command.add_flag("--der", der, "DER in place of PEM");
+    command.add_flag("--statement", statement, "the signed statement of an attested key").excludes(der_flag);
     command.footer(export_examples);
   }
   [[nodiscard]] bool binary() const { return der || statement; }
@@ -132,7 +132,7 @@ int run_export(const export_options& options, const context& ctx) {
 struct characteristics_options {
   sealed_key key;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     key.add_to(command);
     command.footer(characteristics_examples);
   }
@@ -152,8 +152,8 @@ int run_characteristics(const characteristics_options& options, const context& c
 struct delete_options {
   std::string path;
 
-  void add_to(CLI::App& command) {
-    command.add_option("BLOB", path, "sealed key")->required()->type_name("");
+  void add_to(command_line& command) {
+    command.add_option("BLOB", path, "sealed key").required().type_name("");
     command.footer(delete_examples);
   }
 };
@@ -179,7 +179,7 @@ int run_delete(const delete_options& options, const context& ctx) {
 }
 
 struct delete_all_options {
-  void add_to(CLI::App& command) { command.footer(delete_all_examples); }
+  void add_to(command_line& command) { command.footer(delete_all_examples); }
 };
 
 int run_delete_all(const delete_all_options& /*options*/, const context& ctx) {
@@ -191,19 +191,19 @@ int run_delete_all(const delete_all_options& /*options*/, const context& ctx) {
 
 }  // namespace
 
-void define_export(CLI::App& command, context& ctx) {
+void define_export(command_line& command, context& ctx) {
   define<export_options>(command, ctx, run_export);
 }
 
-void define_characteristics(CLI::App& command, context& ctx) {
+void define_characteristics(command_line& command, context& ctx) {
   define<characteristics_options>(command, ctx, run_characteristics);
 }
 
-void define_delete(CLI::App& command, context& ctx) {
+void define_delete(command_line& command, context& ctx) {
   define<delete_options>(command, ctx, run_delete);
 }
 
-void define_delete_all(CLI::App& command, context& ctx) {
+void define_delete_all(command_line& command, context& ctx) {
   define<delete_all_options>(command, ctx, run_delete_all);
 }
 

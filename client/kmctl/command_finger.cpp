@@ -47,8 +47,8 @@ constexpr const char* remove_examples =
 struct enrol_options {
   std::uint64_t secure_id = 0;
 
-  void add_to(CLI::App& command) {
-    add_number(command, "SECURE_ID", secure_id, "the user's secure id")->required();
+  void add_to(command_line& command) {
+    add_number(command, "SECURE_ID", secure_id, "the user's secure id").required();
     command.footer(enrol_examples);
   }
 };
@@ -64,20 +64,20 @@ int run_enrol(const enrol_options& options, const context& ctx) {
 struct finger_option {
   std::uint32_t id = 0;
 
-  void add_to(CLI::App& command) { add_number(command, "FINGER", id, "the finger's id")->required(); }
+  void add_to(command_line& command) { add_number(command, "FINGER", id, "the finger's id").required(); }
 };
 
 struct touch_options {
   finger_option finger;
   std::uint64_t challenge = 0;
   std::optional<std::string> out;
-  CLI::Option* extra_data_option = nullptr;
+  option extra_data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     finger.add_to(command);
     add_number(command, "--challenge", challenge, "the operation that the token is for (default: 0, none)");
     extra_data_option = command.add_option("-o,--output", out, "file for the auth token, - for standard output");
-    extra_data_option->type_name("FILE");
+    extra_data_option.type_name("FILE");
     command.footer(touch_examples);
   }
 };
@@ -110,7 +110,7 @@ int run_touch(const touch_options& options, const context& ctx) {
 }
 
 struct list_options {
-  void add_to(CLI::App& command) { command.footer(list_examples); }
+  void add_to(command_line& command) { command.footer(list_examples); }
 };
 
 int run_list(const list_options& /*options*/, const context& ctx) {
@@ -128,7 +128,7 @@ int run_list(const list_options& /*options*/, const context& ctx) {
 struct remove_options {
   finger_option finger;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     finger.add_to(command);
     command.footer(remove_examples);
   }
@@ -150,7 +150,7 @@ constexpr std::array commands = std::to_array<command_row>({
 
 }  // namespace
 
-void define_finger(CLI::App& group, context& ctx) {
+void define_finger(command_line& group, context& ctx) {
   define_group(group, ctx, commands);
 }
 

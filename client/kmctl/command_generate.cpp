@@ -60,11 +60,9 @@ struct blob_output {
   std::string path;
   bool force = false;
 
-  CLI::Option* add_to(CLI::App& command) {
+  option add_to(command_line& command) {
     command.add_flag("--force", force, "overwrite an existing file");
-    return command.add_option("BLOB", path, "file for the sealed blob, - for standard output")
-        ->required()
-        ->type_name("");
+    return command.add_option("BLOB", path, "file for the sealed blob, - for standard output").required().type_name("");
   }
   [[nodiscard]] output_rules rules() const {
     return {.existing = force ? overwrite::always : overwrite::never, .mode = blob_mode};
@@ -80,9 +78,9 @@ struct generate_options {
   authorization_options description;
   application_options app;
   blob_output out;
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     description.add_to(command, option_use::generate);
     app.add_to(command);
     data_option = out.add_to(command);
@@ -96,16 +94,16 @@ struct import_options {
   blob_output out;
   std::string file;
   std::optional<std::string> passphrase;
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     description.add_to(command, option_use::import);
     app.add_to(command);
-    command.add_option("FILE", file, "private key, - for standard input")->required()->type_name("");
+    command.add_option("FILE", file, "private key, - for standard input").required().type_name("");
     data_option = out.add_to(command);
     command
         .add_option("--passphrase", passphrase, "of an encrypted key: @FILE, or as it stands (others can see it there)")
-        ->type_name("VALUE");
+        .type_name("VALUE");
     command.footer(import_examples);
   }
 };
@@ -203,11 +201,11 @@ int run_import(const import_options& options, const context& ctx) {
 
 }  // namespace
 
-void define_generate(CLI::App& command, context& ctx) {
+void define_generate(command_line& command, context& ctx) {
   define<generate_options>(command, ctx, run_generate);
 }
 
-void define_import(CLI::App& command, context& ctx) {
+void define_import(command_line& command, context& ctx) {
   define<import_options>(command, ctx, run_import);
 }
 

@@ -20,7 +20,7 @@ constexpr const char* examples =
     "  kmctl --state /tmp/device info     a device of its own, made on first use\n";
 
 struct info_options {
-  void add_to(CLI::App& command) { command.footer(examples); }
+  void add_to(command_line& command) { command.footer(examples); }
 };
 
 constexpr TEEC_UUID keymaster_ta = KEYMASTER_TA_UUID;
@@ -105,7 +105,7 @@ int run_info(const info_options& /*options*/, const context& ctx) {
 
 }  // namespace
 
-void define_info(CLI::App& command, context& ctx) {
+void define_info(command_line& command, context& ctx) {
   define<info_options>(command, ctx, run_info);
 }
 

@@ -52,11 +52,11 @@ struct signing_options {
     }
     return all;
   }
-  void add_blob_to(CLI::App& command) {
-    command.add_option("BLOB", blob, "sealed key, - for standard input")->required()->type_name("");
+  void add_blob_to(command_line& command) {
+    command.add_option("BLOB", blob, "sealed key, - for standard input").required().type_name("");
   }
-  void add_rest_to(CLI::App& command) {
-    command.add_option("FILE", file, "the data, - for standard input (the default)")->type_name("");
+  void add_rest_to(command_line& command) {
+    command.add_option("FILE", file, "the data, - for standard input (the default)").type_name("");
     parameters.add_to(command, option_use::operation);
     presence.add_to(command);
     app.add_to(command);
@@ -66,13 +66,13 @@ struct signing_options {
 struct sign_options : signing_options {
   std::string out = "-";
   bool statement = false;
-  CLI::Option* data_option = nullptr;
+  option data_option;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     add_blob_to(command);
     add_rest_to(command);
     data_option = command.add_option("-o,--output", out, "file for the signature or MAC (default: standard output)");
-    data_option->type_name("FILE");
+    data_option.type_name("FILE");
     command.add_flag("--statement", statement, "make a signed statement of the message, with an attested key");
     command.footer(sign_examples);
   }
@@ -81,9 +81,9 @@ struct sign_options : signing_options {
 struct verify_options : signing_options {
   std::string signature;
 
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     add_blob_to(command);
-    command.add_option("SIGNATURE", signature, "the signature or MAC, - for standard input")->required()->type_name("");
+    command.add_option("SIGNATURE", signature, "the signature or MAC, - for standard input").required().type_name("");
     add_rest_to(command);
     command.footer(verify_examples);
   }
@@ -160,11 +160,11 @@ int run_verify(const verify_options& options, const context& ctx) {
 
 }  // namespace
 
-void define_sign(CLI::App& command, context& ctx) {
+void define_sign(command_line& command, context& ctx) {
   define<sign_options>(command, ctx, run_sign);
 }
 
-void define_verify(CLI::App& command, context& ctx) {
+void define_verify(command_line& command, context& ctx) {
   define<verify_options>(command, ctx, run_verify);
 }
 

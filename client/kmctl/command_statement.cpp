@@ -37,7 +37,7 @@ constexpr const char* verify_examples =
     "        --record factory.json --ledger ledger.json sign.statement\n";
 
 struct verify_options : statement_options {
-  void add_to(CLI::App& command) {
+  void add_to(command_line& command) {
     statement_options::add_to(command);
     command.footer(verify_examples);
   }
@@ -219,7 +219,7 @@ constexpr std::array statement_rows = std::to_array<command_row>({
 
 }  // namespace
 
-void define_statement(CLI::App& group, context& ctx) {
+void define_statement(command_line& group, context& ctx) {
   define_group(group, ctx, statement_rows);
 }
 

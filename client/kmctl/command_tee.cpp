@@ -62,7 +62,7 @@ void connect(server_management& server, const context& ctx) {
 }
 
 struct status_options {
-  void add_to(CLI::App& command) { command.footer(status_examples); }
+  void add_to(command_line& command) { command.footer(status_examples); }
 };
 
 /// One way to show a number of a record, in text and in JSON.
@@ -132,8 +132,8 @@ int run_status(const status_options& /*options*/, const context& ctx) {
 struct log_options {
   std::uint32_t lines = 0;
 
-  void add_to(CLI::App& command) {
-    add_number(command, "-n,--lines", lines, "show the latest N lines alone")->type_name("N");
+  void add_to(command_line& command) {
+    add_number(command, "-n,--lines", lines, "show the latest N lines alone").type_name("N");
     command.footer(log_examples);
   }
 };
@@ -176,7 +176,7 @@ int run_log(const log_options& options, const context& ctx) {
 }
 
 struct stop_options {
-  void add_to(CLI::App& command) { command.footer(stop_examples); }
+  void add_to(command_line& command) { command.footer(stop_examples); }
 };
 
 int run_stop(const stop_options& /*options*/, const context& ctx) {
@@ -195,7 +195,7 @@ constexpr std::array commands = std::to_array<command_row>({
 
 }  // namespace
 
-void define_tee(CLI::App& group, context& ctx) {
+void define_tee(command_line& group, context& ctx) {
   define_group(group, ctx, commands);
 }
 

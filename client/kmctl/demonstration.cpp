@@ -62,7 +62,7 @@ std::string demonstration::by_openssl(const std::vector<std::string>& words, con
     throw failure_error(fmt::format("openssl did not {}: {}", what, result.output));
   }
   const std::string first = result.output.substr(0, result.output.find('\n'));
-  return fmt::format("   $ {}{}{}", command_line(words), first.empty() ? "" : "\n   ", first);
+  return fmt::format("   $ {}{}{}", shell_words(words), first.empty() ? "" : "\n   ", first);
 }
 
 std::string demonstration::refused(const char* what, const std::function<void()>& attempt,

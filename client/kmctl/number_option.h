@@ -2,11 +2,11 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_NUMBER_OPTION_H_
 #define KEYMASTER_CLIENT_KMCTL_NUMBER_OPTION_H_
 
-#include <CLI/CLI.hpp>
 #include <concepts>
 #include <limits>
 #include <string>
 
+#include "client/kmctl/command_line.h"
 #include "client/kmctl/values.h"
 
 namespace kmctl {
@@ -14,11 +14,11 @@ namespace kmctl {
 /// add_number adds an option or, for a name without dashes, an argument that parse_number reads into `number`, which
 /// must live as long as the command.
 template <std::unsigned_integral Number>
-CLI::Option* add_number(CLI::App& command, const std::string& name, Number& number, const std::string& help) {
+option add_number(command_line& command, const std::string& name, Number& number, const std::string& help) {
   const auto take = [&number](const std::string& text) {
     number = static_cast<Number>(parse_number(text, std::numeric_limits<Number>::max()));
   };
-  return command.add_option_function<std::string>(name, take, help)->type_name(name.starts_with('-') ? "NUMBER" : "");
+  return command.add_option_function(name, take, help).type_name(name.starts_with('-') ? "NUMBER" : "");
 }
 
 }  // namespace kmctl

@@ -121,7 +121,7 @@ command_result run_command(const std::vector<std::string>& words) {
   return {.status = status, .output = std::move(output)};
 }
 
-std::string command_line(const std::vector<std::string>& words) {
+std::string shell_words(const std::vector<std::string>& words) {
   std::string text;
   for (const std::string& word : words) {
     text += (text.empty() ? "" : " ") + quoted(word);

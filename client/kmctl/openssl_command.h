@@ -16,8 +16,8 @@ struct command_result {
 /// can't be started.
 [[nodiscard]] command_result run_command(const std::vector<std::string>& words);
 
-/// command_line gives the words as a person would type them in a shell.
-[[nodiscard]] std::string command_line(const std::vector<std::string>& words);
+/// shell_words gives the words as a person would type them in a shell.
+[[nodiscard]] std::string shell_words(const std::vector<std::string>& words);
 
 /// verify_command gives the words that check a signature over SHA-256 with openssl: RSA PKCS#1 v1.5 or EC.
 [[nodiscard]] std::vector<std::string> verify_command(const std::string& public_key, const std::string& signature,

@@ -166,8 +166,8 @@ secret_bytes ask_password(const std::string& prompt) {
   return password;
 }
 
-CLI::Option* password_option::add_to(CLI::App& command, const std::string& flag, const std::string& help) {
-  return command.add_option(flag, file_, help)->type_name("FILE");
+option password_option::add_to(command_line& command, const std::string& flag, const std::string& help) {
+  return command.add_option(flag, file_, help).type_name("FILE");
 }
 
 secret_bytes password_option::read(const std::string& prompt) const {

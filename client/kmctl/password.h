@@ -2,9 +2,9 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_PASSWORD_H_
 #define KEYMASTER_CLIENT_KMCTL_PASSWORD_H_
 
-#include <CLI/CLI.hpp>
 #include <string>
 
+#include "client/kmctl/command_line.h"
 #include "client/lib/bytes.h"
 
 namespace kmctl {
@@ -22,7 +22,7 @@ using keymaster::client::secret_bytes;
 /// An option that names a password's file.
 class password_option {
  public:
-  CLI::Option* add_to(CLI::App& command, const std::string& flag, const std::string& help);
+  option add_to(command_line& command, const std::string& flag, const std::string& help);
 
   /// The file, empty without one; among a command's inputs.
   [[nodiscard]] const std::string& file() const { return file_; }

@@ -52,22 +52,23 @@ client::attestation_key read_key(const std::string& path, const password_option&
 
 }  // namespace
 
-void provisioning_plan::add_to(CLI::App& command) {
-  auto* const key = command.add_option("--key", key_file_,
-                                       "private key file to use as the attestation key, RSA-2048, - for standard input "
-                                       "(default: one is made inside, and never leaves)");
-  key->type_name("FILE");
-  passphrase_.add_to(command, "--passphrase-file", "file with the passphrase of an encrypted key")->needs(key);
+void provisioning_plan::add_to(command_line& command) {
+  const option key =
+      command.add_option("--key", key_file_,
+                         "private key file to use as the attestation key, RSA-2048, - for standard input "
+                         "(default: one is made inside, and never leaves)");
+  key.type_name("FILE");
+  passphrase_.add_to(command, "--passphrase-file", "file with the passphrase of an encrypted key").needs(key);
   command.add_option("--sensor-name", sensor_name_, "the fingerprint sensor's name")
-      ->type_name("TEXT")
-      ->capture_default_str();
-  command.add_option("--sensor-version", sensor_version_, "its version")->type_name("TEXT")->capture_default_str();
+      .type_name("TEXT")
+      .capture_default();
+  command.add_option("--sensor-version", sensor_version_, "its version").type_name("TEXT").capture_default();
   cpu_id_option_ =
       command.add_option("--cpu-id", cpu_id_, "the processor's serial number, 1 to 63 characters (default: drawn)");
-  cpu_id_option_->type_name("TEXT");
+  cpu_id_option_.type_name("TEXT");
   device_id_option_ = command.add_option("--device-id", device_id_text_,
                                          "the device's id, 16 to 32 bytes: hex:…, @FILE or text (default: drawn)");
-  device_id_option_->type_name("VALUE");
+  device_id_option_.type_name("VALUE");
 }
 
 std::vector<std::string> provisioning_plan::inputs() const {
@@ -79,13 +80,13 @@ std::vector<std::string> provisioning_plan::inputs() const {
 }
 
 void provisioning_plan::complete() {
-  if (cpu_id_option_->empty()) {
+  if (!cpu_id_option_.is_given()) {
     cpu_id_ = to_hex(draw(serial_number_size));
   }
   check_text("--cpu-id", cpu_id_, client::longest_cpu_id);
   check_text("--sensor-name", sensor_name_, longest_sensor_text);
   check_text("--sensor-version", sensor_version_, longest_sensor_text);
-  device_id_ = device_id_option_->empty() ? draw(client::longest_device_id) : read_device_id(device_id_text_);
+  device_id_ = device_id_option_.is_given() ? read_device_id(device_id_text_) : draw(client::longest_device_id);
   refuse_shared_input({&key_file_, &passphrase_.file()});
   if (!key_file_.empty()) {
     key_ = read_key(key_file_, passphrase_);

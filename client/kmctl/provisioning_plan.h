@@ -2,10 +2,10 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_PROVISIONING_PLAN_H_
 #define KEYMASTER_CLIENT_KMCTL_PROVISIONING_PLAN_H_
 
-#include <CLI/CLI.hpp>
 #include <optional>
 #include <string>
 
+#include "client/kmctl/command_line.h"
 #include "client/kmctl/context.h"
 #include "client/kmctl/password.h"
 #include "client/lib/provisioning.h"
@@ -16,7 +16,7 @@ namespace kmctl {
 /// The options that say what goes into the device.
 class provisioning_plan {
  public:
-  void add_to(CLI::App& command);
+  void add_to(command_line& command);
 
   /// inputs gives the files that it comes from; one of them at most may be standard input.
   [[nodiscard]] std::vector<std::string> inputs() const;
@@ -42,8 +42,8 @@ class provisioning_plan {
   std::string sensor_version_ = "1";
   std::string cpu_id_;
   std::string device_id_text_;
-  CLI::Option* cpu_id_option_ = nullptr;  ///< tells an empty text, which is refused, from none
-  CLI::Option* device_id_option_ = nullptr;
+  option cpu_id_option_;  ///< tells an empty text, which is refused, from none
+  option device_id_option_;
 
   std::optional<keymaster::client::attestation_key> key_;
   keymaster::client::bytes device_id_;

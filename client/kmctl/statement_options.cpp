@@ -16,40 +16,40 @@ namespace {
 namespace client = keymaster::client;
 
 /// Adds an option whose every use is handed to `take`.
-CLI::Option* add_value(CLI::App& command, const char* group, const char* flag, const char* type,
-                       const std::function<void(const std::string&)>& take, const char* help) {
-  return command.add_option_function<std::string>(flag, take, help)->type_name(type)->group(group)->trigger_on_parse();
+option add_value(command_line& command, const char* group, const char* flag, const char* type,
+                 const std::function<void(const std::string&)>& take, const char* help) {
+  return command.add_option_function(flag, take, help).type_name(type).group(group).trigger_on_parse();
 }
 
 }  // namespace
 
-void statement_options::add_to(CLI::App& command) {
-  command.add_option("STATEMENT", statement, "the statement, - for standard input")->required()->type_name("");
+void statement_options::add_to(command_line& command) {
+  command.add_option("STATEMENT", statement, "the statement, - for standard input").required().type_name("");
   constexpr const char* group = "Kind of statement";
-  auto* const key_flag =
-      command.add_flag("--export", of_export, "of a key: what kmctl export --statement writes")->group(group);
+  const option key_flag =
+      command.add_flag("--export", of_export, "of a key: what kmctl export --statement writes").group(group);
   command.add_flag("--sign", of_sign, "of a signed message: what kmctl sign --statement writes")
-      ->group(group)
-      ->excludes(key_flag);
+      .group(group)
+      .excludes(key_flag);
   add_signer_options(command);
   add_message_options(command);
   add_memory_options(command);
 }
 
-void statement_options::add_signer_options(CLI::App& command) {
+void statement_options::add_signer_options(command_line& command) {
   constexpr const char* group = "Who signed it";
   const auto add = [&](const char* flag, std::string& to, const char* help) {
-    return command.add_option(flag, to, help)->type_name("FILE")->group(group);
+    return command.add_option(flag, to, help).type_name("FILE").group(group);
   };
-  auto* const record_option = add("--record", record, "the device's factory record, with its attestation key");
-  add("--attk", attk, "the device's attestation key (PEM), where there is no record")->excludes(record_option);
+  const option record_option = add("--record", record, "the device's factory record, with its attestation key");
+  add("--attk", attk, "the device's attestation key (PEM), where there is no record").excludes(record_option);
   add("--signer", signer, "a key that was accepted before (PEM), as --public-key-out writes it");
   extra_data_option =
       command.add_option("--public-key-out", public_key_out, "file for the accepted key (PEM), - for standard output");
-  extra_data_option->type_name("FILE")->group(group);
+  extra_data_option.type_name("FILE").group(group);
 }
 
-void statement_options::add_message_options(CLI::App& command) {
+void statement_options::add_message_options(command_line& command) {
   constexpr const char* group = "What it must say";
   const auto take_challenge = [this](const std::string& text) {
     if (const auto file = file_of_value(text)) {
@@ -66,8 +66,8 @@ void statement_options::add_message_options(CLI::App& command) {
     }
   };
   add_value(command, group, "--finger", "ID", take_finger, "a finger that may have touched; repeat it for others")
-      ->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
-  command.add_flag("--any-finger", any_finger, "some finger must have touched")->group(group);
+      .take_last();
+  command.add_flag("--any-finger", any_finger, "some finger must have touched").group(group);
   const auto take_uid = [this](const std::string& text) {
     uid = static_cast<std::uint32_t>(parse_number(text, client::no_uid - 1));
   };
@@ -83,16 +83,16 @@ void statement_options::add_message_options(CLI::App& command) {
   add_value(command, group, "--digest", "NAME", take_digest, "digest of the key's signatures (default: sha-256)");
 }
 
-void statement_options::add_memory_options(CLI::App& command) {
+void statement_options::add_memory_options(command_line& command) {
   constexpr const char* group = "The device's counter";
   const auto take_counter = [this](const std::string& text) { last_counter = parse_number(text, UINT64_MAX); };
-  auto* const last = add_value(command, group, "--last-counter", "NUMBER", take_counter,
-                               "the last one seen of this device, in any of its statements");
+  const option last = add_value(command, group, "--last-counter", "NUMBER", take_counter,
+                                "the last one seen of this device, in any of its statements");
   command
       .add_option("--ledger", ledger, "file that remembers the last one; it is begun, and written after an acceptance")
-      ->type_name("FILE")
-      ->group(group)
-      ->excludes(last);
+      .type_name("FILE")
+      .group(group)
+      .excludes(last);
 }
 
 std::vector<std::string> statement_options::inputs() const {

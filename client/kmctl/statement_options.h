@@ -2,12 +2,12 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_STATEMENT_OPTIONS_H_
 #define KEYMASTER_CLIENT_KMCTL_STATEMENT_OPTIONS_H_
 
-#include <CLI/CLI.hpp>
 #include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
 
+#include "client/kmctl/command_line.h"
 #include "client/lib/bytes.h"
 #include "client/lib/rsa_public_key.h"
 
@@ -26,9 +26,9 @@ struct statement_options {
   std::optional<std::uint32_t> uid;
   std::optional<std::uint64_t> last_counter;
   std::string ledger;
-  CLI::Option* extra_data_option = nullptr;
+  option extra_data_option;
 
-  void add_to(CLI::App& command);
+  void add_to(command_line& command);
 
   /// check refuses options that do not go together, and outputs that could not be written. Throws usage_error,
   /// failure_error.
@@ -41,9 +41,9 @@ struct statement_options {
   [[nodiscard]] std::optional<std::vector<std::uint32_t>> expected_fingers() const;
 
  private:
-  void add_signer_options(CLI::App& command);
-  void add_message_options(CLI::App& command);
-  void add_memory_options(CLI::App& command);
+  void add_signer_options(command_line& command);
+  void add_message_options(command_line& command);
+  void add_memory_options(command_line& command);
   void check_kind() const;
   void check_signer() const;
   void check_files() const;

@@ -29,25 +29,25 @@ bool needs_user(keymaster::keymaster_purpose_t purpose, const authorizations& ke
 
 }  // namespace
 
-void presence_options::add_to(CLI::App& command) {
+void presence_options::add_to(command_line& command) {
   constexpr const char* group = "User authentication";
   const auto take_number = [](std::optional<std::uint32_t>& to) {
     return [&to](const std::string& text) { to = static_cast<std::uint32_t>(parse_number(text, UINT32_MAX)); };
   };
   command
-      .add_option_function<std::string>("--finger", take_number(finger_),
-                                        "the finger that touches the sensor, as kmctl finger enrol numbered it")
-      ->type_name("ID")
-      ->group(group);
-  auto* const handle = command.add_option("--auth-handle", handle_, "a user's password handle, as of kmctl auth enrol");
-  auto* const uid =
-      command.add_option_function<std::string>("--auth-uid", take_number(uid_), "the number of that user");
-  handle->type_name("FILE")->group(group)->needs(uid);
-  uid->type_name("NUMBER")->group(group)->needs(handle);
+      .add_option_function("--finger", take_number(finger_),
+                           "the finger that touches the sensor, as kmctl finger enrol numbered it")
+      .type_name("ID")
+      .group(group);
+  const option handle =
+      command.add_option("--auth-handle", handle_, "a user's password handle, as of kmctl auth enrol");
+  const option uid = command.add_option_function("--auth-uid", take_number(uid_), "the number of that user");
+  handle.type_name("FILE").group(group).needs(uid);
+  uid.type_name("NUMBER").group(group).needs(handle);
   password_.add_to(command, "--password-file", "file with the password (default: it is asked)")
-      ->group(group)
-      ->needs(handle);
-  waiting_.add_to(command)->group(group)->needs(handle);
+      .group(group)
+      .needs(handle);
+  waiting_.add_to(command).group(group).needs(handle);
 }
 
 std::vector<std::string> presence_options::files() const {

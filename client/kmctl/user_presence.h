@@ -2,12 +2,12 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_USER_PRESENCE_H_
 #define KEYMASTER_CLIENT_KMCTL_USER_PRESENCE_H_
 
-#include <CLI/CLI.hpp>
 #include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
 
+#include "client/kmctl/command_line.h"
 #include "client/kmctl/password.h"
 #include "client/kmctl/waiting.h"
 #include "client/lib/authorizations.h"
@@ -18,7 +18,7 @@ namespace kmctl {
 /// Collects --finger, and --auth-handle with --auth-uid and --password-file.
 class presence_options {
  public:
-  void add_to(CLI::App& command);
+  void add_to(command_line& command);
 
   /// The files that a command reads for them, in which one "-" at most may be.
   [[nodiscard]] std::vector<std::string> files() const;

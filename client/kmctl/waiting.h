@@ -2,10 +2,10 @@
 #ifndef KEYMASTER_CLIENT_KMCTL_WAITING_H_
 #define KEYMASTER_CLIENT_KMCTL_WAITING_H_
 
-#include <CLI/CLI.hpp>
 #include <chrono>
 #include <thread>
 
+#include "client/kmctl/command_line.h"
 #include "client/kmctl/progress.h"
 #include "client/lib/error.h"
 
@@ -14,7 +14,7 @@ namespace kmctl {
 /// --wait: whether the user sits the time out. It passes while the secure world runs, and that ends with the command.
 class waiting_option {
  public:
-  CLI::Option* add_to(CLI::App& command) {
+  option add_to(command_line& command) {
     return command.add_flag("--wait", wait_, "sit out the time that wrong passwords cost, instead of failing");
   }
 

@@ -1,5 +1,6 @@
 #include "client/texts/command_tree.h"
 
+#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <array>
 #include <regex>

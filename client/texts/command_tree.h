@@ -2,9 +2,12 @@
 #ifndef KEYMASTER_CLIENT_TEXTS_COMMAND_TREE_H_
 #define KEYMASTER_CLIENT_TEXTS_COMMAND_TREE_H_
 
-#include <CLI/CLI.hpp>
 #include <string>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 namespace texts {
 

@@ -3,6 +3,7 @@
 //     kmctl_texts manual PAGE.in > PAGE
 //     kmctl_texts document PAGE.in DOCUMENT.md > PAGE
 //     kmctl_texts bash|zsh|fish > COMPLETION
+#include <CLI/CLI.hpp>
 #include <array>
 #include <exception>
 #include <fstream>

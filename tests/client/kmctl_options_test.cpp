@@ -1,8 +1,11 @@
 // What the command line becomes: descriptions of keys, parameters of operations, and what is shown of them.
 #include <gtest/gtest.h>
 
+#include <CLI/CLI.hpp>
+
 #include "client/kmctl/application.h"
 #include "client/kmctl/authorization_options.h"
+#include "client/kmctl/command_line.h"
 #include "client/kmctl/describe.h"
 #include "client/kmctl/exit_codes.h"
 #include "client/kmctl/openssl_command.h"
@@ -17,7 +20,8 @@ using client::bytes;
 authorizations parse(option_use use, const std::string& line) {
   CLI::App app;
   authorization_options options;
-  options.add_to(app, use);
+  command_line command(app);
+  options.add_to(command, use);
   app.parse(line);
   return options.given();
 }
@@ -254,9 +258,9 @@ TEST(CommandLine, EverySubCommandTeaches) {
 }
 
 TEST(OpensslCommand, IsPrintedAsAShellTakesIt) {
-  EXPECT_EQ(command_line({"openssl", "a b", "it's", "", "x=/y"}), "openssl 'a b' 'it'\\''s' '' x=/y");
+  EXPECT_EQ(shell_words({"openssl", "a b", "it's", "", "x=/y"}), "openssl 'a b' 'it'\\''s' '' x=/y");
   EXPECT_EQ(verify_command("p.pem", "s", "-f").back(), "./-f");
-  EXPECT_EQ(command_line(mac_command("00ff", "-f")), "openssl dgst -sha256 -mac HMAC -macopt hexkey:00ff ./-f");
+  EXPECT_EQ(shell_words(mac_command("00ff", "-f")), "openssl dgst -sha256 -mac HMAC -macopt hexkey:00ff ./-f");
 }
 
 TEST(OpensslCommand, GivesStatusAndOutput) {
