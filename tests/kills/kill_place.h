@@ -1,11 +1,18 @@
-// Where a server that is killed keeps what it has.
+// The server that is killed, and where it keeps what it has.
 #ifndef TESTS_KILLS_KILL_PLACE_H_
 #define TESTS_KILLS_KILL_PLACE_H_
 
 #include <filesystem>
-#include <string>
+
+#include "tests/support/teed_process.h"
 
 namespace hosted_tee::testing {
+
+using testing_support::ample_time;
+using testing_support::process_end;
+using testing_support::server_place;
+using testing_support::teed_process;
+using enum testing_support::teed_exit;
 
 /// A folder that is removed with the test, in memory where that can be had: a device writes durably, and a disk would
 /// make hundreds of starts slow. What a killed process has written is there either way.
@@ -19,14 +26,6 @@ class kill_folder {
 
  private:
   std::filesystem::path path_;
-};
-
-/// What a server is started on.
-struct server_place {
-  std::filesystem::path state;
-  std::filesystem::path socket;
-
-  [[nodiscard]] std::string context_name() const { return "unix:" + socket.string(); }
 };
 
 }  // namespace hosted_tee::testing

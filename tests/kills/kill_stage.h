@@ -9,7 +9,7 @@
 #include <mutex>
 #include <string>
 
-#include "tests/kills/teed_process.h"
+#include "tests/kills/kill_place.h"
 
 namespace hosted_tee::testing {
 

@@ -7,7 +7,7 @@
 #include <thread>
 
 #include "tee/client/management.h"
-#include "tests/kills/teed_process.h"
+#include "tests/kills/kill_place.h"
 
 namespace hosted_tee::testing {
 namespace {

@@ -1,10 +1,17 @@
 #include "tests/load/load_fixture.h"
 
+#include <fmt/format.h>
+
 #include <algorithm>
+#include <cstdio>
 
 namespace load {
 
 LoadTest::LoadTest() : keys(fill_shelf(teed.name())) {}
+
+LoadTest::~LoadTest() {
+  if (HasFailure()) fmt::print(stderr, "teed said:\n{}\n", teed.said());
+}
 
 void LoadTest::warm_up() {
   tally counts;

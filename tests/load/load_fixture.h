@@ -4,7 +4,7 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/load/teed_process.h"
+#include "tests/load/watched_teed.h"
 #include "tests/load/worker.h"
 
 namespace load {
@@ -12,8 +12,9 @@ namespace load {
 class LoadTest : public ::testing::Test {
  protected:
   LoadTest();
+  ~LoadTest() override;
 
-  teed_process teed;
+  watched_teed teed;
   key_shelf keys;
 
   /// Some hundred steps of one client, so that whatever is made once is made.
@@ -28,7 +29,7 @@ class LoadTest : public ::testing::Test {
   /// expect_as_before waits until the server has what it had at rest, and compares a fresh instance as well.
   void expect_as_before(const holdings& rest, const hosted_tee::ta_status& fresh);
 
-  void expect_good_end() { EXPECT_EQ(teed.stop(), 0); }
+  void expect_good_end() { EXPECT_EQ(teed.stop().code, testing_support::teed_done); }
 };
 
 void expect_same(const hosted_tee::ta_status& now, const hosted_tee::ta_status& before);

@@ -27,7 +27,7 @@ constexpr std::size_t operation_places = 16;
 /// Clients that work until they are told to end.
 class crowd {
  public:
-  crowd(const teed_process& teed, const key_shelf& keys) : name_(teed.name()) {
+  crowd(const watched_teed& teed, const key_shelf& keys) : name_(teed.name()) {
     for (std::uint32_t i = 0; i < clients; ++i) {
       threads_.emplace_back([this, i, &keys] {
         try {

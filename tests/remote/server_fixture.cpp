@@ -1,6 +1,5 @@
 #include "tests/remote/server_fixture.h"
 
-#include <chrono>
 #include <fstream>
 
 namespace hosted_tee::testing {
@@ -18,16 +17,6 @@ running_server::~running_server() {
 
 void running_server::join() {
   if (thread_.joinable()) thread_.join();
-}
-
-bool eventually(const std::function<bool()>& holds) {
-  using namespace std::chrono_literals;
-  const auto end = std::chrono::steady_clock::now() + 10s;
-  while (!holds()) {
-    if (std::chrono::steady_clock::now() > end) return false;
-    std::this_thread::sleep_for(5ms);
-  }
-  return true;
 }
 
 belongings current_belongings() {

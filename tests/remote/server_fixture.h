@@ -2,7 +2,6 @@
 #ifndef TESTS_REMOTE_SERVER_FIXTURE_H_
 #define TESTS_REMOTE_SERVER_FIXTURE_H_
 
-#include <functional>
 #include <memory>
 #include <string>
 #include <thread>
@@ -11,6 +10,7 @@
 #include "tee/server/listener.h"
 #include "tee/server/server.h"
 #include "tests/remote/raw_client.h"
+#include "tests/support/eventually.h"
 #include "tests/tee/world_fixture.h"
 
 namespace hosted_tee::testing {
@@ -34,8 +34,7 @@ class running_server {
   std::thread thread_;
 };
 
-/// eventually tries again and again, for at most ten seconds, until `holds`.
-bool eventually(const std::function<bool()>& holds);
+using ::testing_support::eventually;
 
 /// What this process has open and mapped of what servers and clients make.
 struct belongings {

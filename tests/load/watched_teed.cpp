@@ -1,16 +1,10 @@
-#include "tests/load/teed_process.h"
+#include "tests/load/watched_teed.h"
 
 #include <fmt/format.h>
-#include <spawn.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <chrono>
-#include <csignal>
 #include <fstream>
 #include <ostream>
 #include <stdexcept>
-#include <thread>
 
 namespace load {
 namespace {
@@ -54,33 +48,28 @@ void PrintTo(const holdings& what, std::ostream* out) {
       what.block_bytes);
 }
 
-teed_process::teed_process() : socket_((folder_.path() / "tee.sock").string()) {
-  const std::string state = (folder_.path() / "state").string();
-  // The limit of a process is a quarter of that of all: enough for the clients of a test with their guests.
-  const char* const arguments[] = {TEED_PATH,       "--state",           state.c_str(), "--socket",
-                                   socket_.c_str(), "--max-connections", "1024",        nullptr};
-  const int failed = ::posix_spawn(&pid_, TEED_PATH, nullptr, nullptr, const_cast<char**>(arguments), environ);
-  if (failed != 0) throw std::runtime_error(fmt::format("{} can't be started: {}", TEED_PATH, failed));
+// The limit of a process is a quarter of that of all: enough for the clients of a test with their guests.
+watched_teed::watched_teed()
+    : place_{folder_.path() / "state", folder_.path() / "tee.sock"}, process_(place_, {"--max-connections", "1024"}) {
   if (!eventually([this] { return management_.connect(name()).result == TEEC_SUCCESS; }))
-    throw std::runtime_error("teed does not answer");
+    throw std::runtime_error("teed does not answer: " + process_.said());
 }
 
-teed_process::~teed_process() {
-  if (pid_ != 0) (void)stop();
+std::string watched_teed::proc() const {
+  return fmt::format("/proc/{}", process_.pid());
 }
 
-hosted_tee::server_status teed_process::status() {
+hosted_tee::server_status watched_teed::status() {
   hosted_tee::server_status now;
   if (management_.status(now).result != TEEC_SUCCESS) throw std::runtime_error("teed tells nothing");
   return now;
 }
 
-holdings teed_process::holdings_now() {
-  const std::string proc = fmt::format("/proc/{}", pid_);
+holdings watched_teed::holdings_now() {
   const hosted_tee::server_status now = status();
-  return {count_descriptors(proc),
-          status_number(proc, "Threads"),
-          count_shared_maps(proc),
+  return {count_descriptors(proc()),
+          status_number(proc(), "Threads"),
+          count_shared_maps(proc()),
           now.connections,
           now.sessions,
           static_cast<std::uint32_t>(now.tas.size()),
@@ -88,27 +77,8 @@ holdings teed_process::holdings_now() {
           now.shared_bytes};
 }
 
-std::size_t teed_process::own_memory() const {
-  return status_number(fmt::format("/proc/{}", pid_), "RssAnon") * 1024;
-}
-
-int teed_process::stop() {
-  (void)::kill(pid_, SIGTERM);
-  int ended = 0;
-  while (::waitpid(pid_, &ended, 0) < 0 && errno == EINTR) {
-  }
-  pid_ = 0;
-  return WIFEXITED(ended) ? WEXITSTATUS(ended) : 128 + WTERMSIG(ended);
-}
-
-bool eventually(const std::function<bool()>& holds) {
-  using namespace std::chrono_literals;
-  const auto end = std::chrono::steady_clock::now() + 10s;
-  while (!holds()) {
-    if (std::chrono::steady_clock::now() > end) return false;
-    std::this_thread::sleep_for(5ms);
-  }
-  return true;
+std::size_t watched_teed::own_memory() const {
+  return status_number(proc(), "RssAnon") * 1024;
 }
 
 }  // namespace load

@@ -1,16 +1,17 @@
-// teed as a process, and what can be seen of it from outside.
-#ifndef TESTS_LOAD_TEED_PROCESS_H_
-#define TESTS_LOAD_TEED_PROCESS_H_
+// teed, and what can be seen of it from outside.
+#ifndef TESTS_LOAD_WATCHED_TEED_H_
+#define TESTS_LOAD_WATCHED_TEED_H_
 
-#include <sys/types.h>
-
-#include <functional>
 #include <string>
 
 #include "tee/client/management.h"
 #include "tests/support/device_fixture.h"
+#include "tests/support/eventually.h"
+#include "tests/support/teed_process.h"
 
 namespace load {
+
+using testing_support::eventually;
 
 /// What the kernel and the server itself say that the server has.
 struct holdings {
@@ -24,14 +25,11 @@ void PrintTo(const holdings& what, std::ostream* out);
 
 /// The server runs from the constructor, which waits until it answers, to the end of the scope. Functions throw
 /// std::runtime_error when the server does not answer them.
-class teed_process {
+class watched_teed {
  public:
-  teed_process();
-  teed_process(const teed_process&) = delete;
-  teed_process& operator=(const teed_process&) = delete;
-  ~teed_process();
+  watched_teed();
 
-  [[nodiscard]] std::string name() const { return "unix:" + socket_; }
+  [[nodiscard]] std::string name() const { return place_.context_name(); }
 
   /// One of the connections is this object's own. It is always the same, so that looking changes nothing.
   [[nodiscard]] hosted_tee::server_status status();
@@ -39,19 +37,21 @@ class teed_process {
   /// own_memory is what the server has of its own, in bytes: without files and what it shares with clients.
   [[nodiscard]] std::size_t own_memory() const;
 
-  /// stop has the server end, and answers its exit code.
-  int stop();
+  /// said is what the server wrote on standard error.
+  [[nodiscard]] std::string said() const { return process_.said(); }
+
+  /// stop has the server end, and answers how it went.
+  testing_support::process_end stop() { return process_.terminate(); }
 
  private:
+  [[nodiscard]] std::string proc() const;
+
   testing_support::temporary_folder folder_;
-  std::string socket_;
-  pid_t pid_ = 0;
+  testing_support::server_place place_;
+  testing_support::teed_process process_;
   hosted_tee::server_management management_;
 };
 
-/// eventually tries again and again, for at most ten seconds, until `holds`.
-bool eventually(const std::function<bool()>& holds);
-
 }  // namespace load
 
-#endif  // TESTS_LOAD_TEED_PROCESS_H_
+#endif  // TESTS_LOAD_WATCHED_TEED_H_

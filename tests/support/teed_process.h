@@ -1,17 +1,26 @@
 // The server as people run it: a process, to be ended in every way there is.
-#ifndef TESTS_KILLS_TEED_PROCESS_H_
-#define TESTS_KILLS_TEED_PROCESS_H_
+#ifndef TESTS_SUPPORT_TEED_PROCESS_H_
+#define TESTS_SUPPORT_TEED_PROCESS_H_
 
 #include <sys/types.h>
 
 #include <chrono>
+#include <filesystem>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "tee/runtime/file_descriptor.h"
-#include "tests/kills/kill_place.h"
 
-namespace hosted_tee::testing {
+namespace testing_support {
+
+/// What a server is started on.
+struct server_place {
+  std::filesystem::path state;
+  std::filesystem::path socket;
+
+  [[nodiscard]] std::string context_name() const { return "unix:" + socket.string(); }
+};
 
 /// The server's exit codes, as its manual has them.
 enum teed_exit : int { teed_done = 0, teed_no_state = 3, teed_socket_taken = 4 };
@@ -30,8 +39,8 @@ struct process_end {
 /// it, kills what still runs.
 class teed_process {
  public:
-  /// Throws std::system_error.
-  explicit teed_process(const server_place& place);
+  /// `switches` follow those for the place. Throws std::system_error.
+  explicit teed_process(const server_place& place, std::vector<std::string> switches = {});
   teed_process(const teed_process&) = delete;
   teed_process& operator=(const teed_process&) = delete;
   ~teed_process();
@@ -55,11 +64,11 @@ class teed_process {
   void signal(int number) const;
 
   pid_t pid_ = -1;
-  file_descriptor said_;     // an anonymous file
-  file_descriptor process_;  // readable when the process has ended
+  hosted_tee::file_descriptor said_;     // an anonymous file
+  hosted_tee::file_descriptor process_;  // readable when the process has ended
   std::optional<process_end> end_;
 };
 
-}  // namespace hosted_tee::testing
+}  // namespace testing_support
 
-#endif  // TESTS_KILLS_TEED_PROCESS_H_
+#endif  // TESTS_SUPPORT_TEED_PROCESS_H_

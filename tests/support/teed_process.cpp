@@ -1,4 +1,4 @@
-#include "tests/kills/teed_process.h"
+#include "tests/support/teed_process.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -14,9 +14,8 @@
 #include <csignal>
 #include <string_view>
 #include <system_error>
-#include <vector>
 
-namespace hosted_tee::testing {
+namespace testing_support {
 namespace {
 
 [[noreturn]] void fail(const char* what) {
@@ -51,9 +50,11 @@ std::vector<char*> pointers(std::vector<std::string>& texts) {
 
 }  // namespace
 
-teed_process::teed_process(const server_place& place) : said_(::memfd_create("said", MFD_CLOEXEC)) {
+teed_process::teed_process(const server_place& place, std::vector<std::string> switches)
+    : said_(::memfd_create("said", MFD_CLOEXEC)) {
   if (!said_.is_open()) fail("memfd_create");
-  std::vector<std::string> words = {TEED_COMMAND, "--state", place.state, "--socket", place.socket};
+  std::vector<std::string> words = {TEED_PATH, "--state", place.state, "--socket", place.socket};
+  words.insert(words.end(), switches.begin(), switches.end());
   std::vector<std::string> variables = environment();
   const std::vector<char*> arguments = pointers(words), settings = pointers(variables);
   pid_ = ::fork();
@@ -62,10 +63,10 @@ teed_process::teed_process(const server_place& place) : said_(::memfd_create("sa
     // Nothing here but what is safe beside the other threads that this process had.
     (void)::prctl(PR_SET_PDEATHSIG, SIGKILL);
     (void)::dup2(said_.get(), STDERR_FILENO);
-    ::execve(TEED_COMMAND, arguments.data(), settings.data());
+    ::execve(TEED_PATH, arguments.data(), settings.data());
     ::_exit(127);
   }
-  process_ = file_descriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0)));
+  process_ = hosted_tee::file_descriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0)));
   if (!process_.is_open()) fail("pidfd_open");
 }
 
@@ -113,4 +114,4 @@ process_end teed_process::terminate() {
   return wait();
 }
 
-}  // namespace hosted_tee::testing
+}  // namespace testing_support
