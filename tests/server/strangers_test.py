@@ -1,11 +1,12 @@
 #!/usr/bin/env python3
-"""teed among programs that mean it no good, or have no room for it: floods, false names, want of threads, descriptors
-and readers.
+"""teed among programs that mean it no good, or have no room for it: floods, clients that never rest, false names, want
+of threads, descriptors and readers.
 
 usage: strangers_test.py TEED KMCTL [unittest arguments]
 """
 import contextlib
 import fcntl
+import mmap
 import os
 import resource
 import shutil
@@ -14,14 +15,16 @@ import socket
 import struct
 import subprocess
 import sys
+import time
 import unittest
 
 import teed_test
 from teed_test import DONE, NO_CONNECTION, USAGE, wait_until
 
-HELLO, OPEN_SESSION, SHARE_MEMORY, REFUSED = 1, 2, 5, 0x8000
+HELLO, OPEN_SESSION, INVOKE, SHARE_MEMORY, USE_SLOTS, REFUSED = 1, 2, 3, 5, 7, 0x8000
 CROWDED = 3
-SUCCESS, ACCESS_DENIED, OUT_OF_MEMORY = 0, 0xFFFF0001, 0xFFFF000C
+SUCCESS, ACCESS_DENIED, NOT_SUPPORTED, OUT_OF_MEMORY, COMMUNICATION = 0, 0xFFFF0001, 0xFFFF000A, 0xFFFF000C, 0xFFFF000E
+FROM_COMMS, FROM_THE_TA = 2, 4
 LOGIN_PUBLIC, LOGIN_USER, LOGIN_APPLICATION = 0, 1, 4
 TA = bytes.fromhex("fbacea43f4754df3866f76256aba994f")
 IN_OUT = 3
@@ -53,6 +56,21 @@ print(hex(struct.unpack_from("<I", ask(2, bytes.fromhex(sys.argv[2]) + struct.pa
 """
 
 
+def frame_of(kind, body):
+    return b"KTEE" + struct.pack("<HHII", 1, kind, len(body), 1) + body
+
+
+@contextlib.contextmanager
+def sealed_file(size):
+    file = os.memfd_create("test", os.MFD_CLOEXEC | os.MFD_ALLOW_SEALING)
+    try:
+        os.ftruncate(file, size)
+        fcntl.fcntl(file, fcntl.F_ADD_SEALS, fcntl.F_SEAL_SHRINK | fcntl.F_SEAL_GROW | fcntl.F_SEAL_SEAL)
+        yield file
+    finally:
+        os.close(file)
+
+
 class Wire:
     """A client that speaks the wire itself."""
 
@@ -67,7 +85,7 @@ class Wire:
 
     def ask(self, kind, body=b"", files=()):
         """Sends a request; gives the answer's kind and body, or None when the server has closed."""
-        frame = b"KTEE" + struct.pack("<HHII", 1, kind, len(body), 1) + body
+        frame = frame_of(kind, body)
         with contextlib.suppress(BrokenPipeError):  # what was said before that is still to be read
             socket.send_fds(self.tee, [frame], files) if files else self.tee.send(frame)
         try:
@@ -83,14 +101,59 @@ class Wire:
     def log_in(self, method):
         return self.result(OPEN_SESSION, TA + struct.pack("<III", method, 0, 0))
 
+    def session(self):
+        """The number of a new one."""
+        result, _, number = struct.unpack_from("<III", self.ask(OPEN_SESSION, TA + bytes(12))[1])
+        return number if result == SUCCESS else None
+
     def share(self, size):
-        file = os.memfd_create("test", os.MFD_CLOEXEC | os.MFD_ALLOW_SEALING)
-        try:
-            os.ftruncate(file, size)
-            fcntl.fcntl(file, fcntl.F_ADD_SEALS, fcntl.F_SEAL_SHRINK | fcntl.F_SEAL_GROW | fcntl.F_SEAL_SEAL)
+        with sealed_file(size) as file:
             return self.result(SHARE_MEMORY, struct.pack("<II", size, IN_OUT), [file])
-        finally:
-            os.close(file)
+
+
+class BusySlots:
+    """A client's slots with the same request in them again and again: as soon as one is taken the next lies there.
+
+    The command makes an RSA key. It is long enough for a program like this one to be always ahead of the server.
+    """
+
+    SIZE, ANSWER_WORD, REQUEST, ANSWER = 135168, 128 // 4, 4096, 69632
+    TYPES = 0x653
+
+    def __init__(self, client):
+        self.client = client
+        with sealed_file(self.SIZE) as file:
+            self.memory = mmap.mmap(file, self.SIZE)
+            self.result = client.result(USE_SLOTS, files=[file])
+        self.words = memoryview(self.memory).cast("I")
+        self.answers = []
+        wish = struct.pack("<I", 3) + b"".join(
+            struct.pack("<IIQQ", tag, 0, value, 0)
+            for tag, value in ((0x10000002, 1), (0x30000003, 2048), (0x500000C8, 65537)))
+        slots = struct.pack("<5I", self.TYPES, 0, 0, 0, len(wish)) + wish + struct.pack("<II", 0, 8192)
+        frame = frame_of(INVOKE, struct.pack("<II", client.session(), 13) + slots)
+        self.memory[self.REQUEST:self.REQUEST + len(frame)] = frame
+        self.length = len(frame)
+
+    def start(self):
+        wait_until(lambda: self.words[0] == 1)  # the server sleeps
+        self.words[0] = self.length
+        self.client.tee.send(b"\0")
+
+    def go_on(self, until, seconds):
+        """Whether `until` has come true."""
+        end = time.monotonic() + seconds
+        while not until() and time.monotonic() < end:
+            if self.words[0] == 0:
+                self.words[0] = self.length
+            if self.words[self.ANSWER_WORD] > 1:
+                self.answers.append(struct.unpack_from("<4I", self.memory, self.ANSWER + 16))
+                self.words[self.ANSWER_WORD] = 0
+        return until()
+
+    def close(self):
+        self.words.release()
+        self.memory.close()
 
 
 class StrangersTest(teed_test.TeedTest):
@@ -174,6 +237,23 @@ class FloodTest(StrangersTest):
             for one in flood:
                 one.kill()
                 one.wait()
+
+
+class RestlessTest(StrangersTest):
+    def test_a_client_that_never_rests_does_not_keep_the_server_from_ending(self):
+        teed = self.start()
+        slots = BusySlots(self.greeted())
+        self.addCleanup(slots.close)
+        if slots.result == NOT_SUPPORTED:
+            self.skipTest("SKIPPED: slots take two processors")
+        slots.start()
+        self.assertTrue(slots.go_on(lambda: len(slots.answers) == 1, seconds=60))
+        teed.send_signal(signal.SIGTERM)
+        self.assertTrue(slots.go_on(lambda: teed.poll() is not None, seconds=30), f"{len(slots.answers)} answers")
+        # One may have been on its way when the server was told.
+        late = [answer[:2] for answer in slots.answers if answer != (SUCCESS, FROM_THE_TA, slots.TYPES, 0)]
+        self.assertIn(late, ([], [(COMMUNICATION, FROM_COMMS)]))
+        self.expect_end(teed, DONE)
 
 
 class SharesTest(StrangersTest):
