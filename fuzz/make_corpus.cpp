@@ -14,6 +14,7 @@
 #include "fuzz/frame_kinds.h"
 #include "fuzz/fuzz_steps.h"
 #include "fuzz/request_maker.h"
+#include "fuzz/slot_seeds.h"
 #include "fuzz/soter_steps.h"
 #include "src/params/keymaster_defs.h"
 #include "tee/remote/messages.h"
@@ -431,6 +432,7 @@ int main(int argc, char** argv) {
       {"soter_fuzzer", fuzzing::soter_seeds()},         {"tlv_fuzzer", fuzzing::tlv_seeds()},
       {"json_fuzzer", fuzzing::json_seeds()},           {"utf8_fuzzer", fuzzing::utf8_seeds()},
       {"statement_fuzzer", fuzzing::statement_seeds()}, {"frame_fuzzer", fuzzing::frame_seeds()},
+      {"slot_fuzzer", fuzzing::slot_seeds()},
   };
   bool written = true;
   for (const auto& [name, seeds] : corpora) written = fuzzing::write(folder / name, seeds) && written;

@@ -43,5 +43,5 @@ fuzz() {
 export -f fuzz
 export build seconds corpus findings
 printf '%s\n' frame_fuzzer:16 command_fuzzer:5 soter_fuzzer:3 marshal_fuzzer:1 signature_fuzzer:1 key_data_fuzzer:1 \
-  tlv_fuzzer:1 json_fuzzer:1 utf8_fuzzer:1 statement_fuzzer:1 |
+  tlv_fuzzer:1 json_fuzzer:1 utf8_fuzzer:1 statement_fuzzer:1 slot_fuzzer:1 |
   xargs -P 2 -I '{}' bash -c 'fuzz "$1"' fuzz '{}'
