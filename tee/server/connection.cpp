@@ -11,6 +11,18 @@ namespace hosted_tee {
 
 using remote::frame_kind;
 
+/// While one is there, the flag is set.
+class mark {
+ public:
+  explicit mark(std::atomic<bool>& flag) : flag_(flag) { flag_ = true; }
+  mark(const mark&) = delete;
+  mark& operator=(const mark&) = delete;
+  ~mark() { flag_ = false; }
+
+ private:
+  std::atomic<bool>& flag_;
+};
+
 /// A kind of request: who carries it out, and with how many descriptors it comes.
 struct connection::request_row {
   frame_kind kind;
@@ -64,6 +76,7 @@ void connection::serve() noexcept {
 
 // Who asked the server to stop sees the connection end when the server has.
 void connection::clean_up() noexcept {
+  const mark working(works_);
   for (const std::uint32_t session : sessions_) {
     try {
       core_.world->close_session(session);
@@ -72,8 +85,14 @@ void connection::clean_up() noexcept {
     }
   }
   sessions_.clear();
-  blocks_.clear();
-  if (!asked_to_stop_) ::shutdown(channel_.socket(), SHUT_RDWR);
+  // At the server's own end a client may still have an answer to take, and goes on without the server.
+  if (core_.stopping) {
+    blocks_.clear();
+  } else {
+    blocks_.remove_all();
+    channel_.empty_slots();
+  }
+  ::shutdown(channel_.socket(), asked_to_stop_ ? SHUT_RD : SHUT_RDWR);
 }
 
 void connection::end_soon() {
@@ -87,8 +106,19 @@ connection::next connection::refuse(remote::refusal why) {
   return next::drop;
 }
 
+// The answer does not wait until what came with the request is closed.
 connection::next connection::serve_one() {
   received packet = channel_.receive(request_room_);
+  const next step = serve_packet(packet);
+  if (!packet.descriptors.empty()) {
+    const mark closing(closes_);
+    packet.descriptors.clear();
+  }
+  return step;
+}
+
+connection::next connection::serve_packet(const received& packet) {
+  const mark working(works_);
   if (packet.how == arrival::end) return next::ended;
   if (packet.how == arrival::overdue) return next::drop;
   remote::frame request;

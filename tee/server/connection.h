@@ -2,6 +2,7 @@
 #ifndef TEE_SERVER_CONNECTION_H_
 #define TEE_SERVER_CONNECTION_H_
 
+#include <atomic>
 #include <cstdint>
 #include <vector>
 
@@ -34,6 +35,14 @@ class connection {
   /// end_soon, from any thread, has serve return after the request that it is working on.
   void end_soon();
 
+  /// Whether its thread closes what the client passed, which may take any time; and whether it carries out or answers a
+  /// request, in which it must not be disturbed.
+  [[nodiscard]] bool closes() const { return closes_; }
+  [[nodiscard]] bool works() const { return works_; }
+
+  /// take_socket gives the socket away, before or after serve.
+  [[nodiscard]] file_descriptor take_socket() { return channel_.take_socket(); }
+
  private:
   struct request_row;
   static const request_row* find_row(std::uint16_t kind);
@@ -41,11 +50,15 @@ class connection {
   enum class next { go_on, ended, drop };
 
   [[nodiscard]] next serve_one();
+  [[nodiscard]] next serve_packet(const received& packet);
   [[nodiscard]] next refuse(remote::refusal why);
   [[nodiscard]] bool may_manage() const;
   [[nodiscard]] TEE_Identity identity_for(const remote::open_request& request, remote::outcome& found) const;
   [[nodiscard]] bool owns(std::uint32_t session) const;
   void clean_up() noexcept;
+
+  template <class Command>
+  void take_turn(remote::outcome& told, const Command& carry_out);
 
   // A request's work: its answer goes into answer_. False when the body is not one of its kind.
   [[nodiscard]] bool hello(const remote::frame& request, int file);
@@ -76,6 +89,7 @@ class connection {
   std::span<const std::uint8_t> answer_;
   bool has_greeted_ = false;
   bool asked_to_stop_ = false;
+  std::atomic<bool> works_{false}, closes_{false};
 };
 
 }  // namespace hosted_tee

@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <mutex>
 #include <string>
 
 #include "tee/runtime/secure_world.h"
@@ -23,7 +24,7 @@ struct server_counters {
   std::atomic<std::uint64_t> dropped{0};
 };
 
-/// The world serialises commands itself; all else here is constant, atomic, or may be called from any thread.
+/// What is neither constant nor atomic may be called from any thread.
 struct server_core {
   std::shared_ptr<secure_world> world;
   std::string state;  ///< the state folder, as it is told to those who ask
@@ -33,6 +34,7 @@ struct server_core {
   std::atomic<bool> stopping{false};
   server_counters counters;
   memory_account memory;
+  std::mutex turn;  ///< whose command it is. The world has a lock too, but those who wait there can't turn back.
 };
 
 }  // namespace hosted_tee

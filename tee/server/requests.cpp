@@ -22,6 +22,17 @@ constexpr outcome refused(TEEC_Result why) {
 
 }  // namespace
 
+// The server ends with the command that runs, and begins none of those that wait behind it.
+template <class Command>
+void connection::take_turn(remote::outcome& told, const Command& carry_out) {
+  const std::scoped_lock turn(core_.turn);
+  if (core_.stopping) {
+    told = refused(TEEC_ERROR_COMMUNICATION);
+  } else {
+    carry_out();
+  }
+}
+
 bool connection::owns(std::uint32_t session) const {
   return std::find(sessions_.begin(), sessions_.end(), session) != sessions_.end();
 }
@@ -65,8 +76,10 @@ bool connection::open_session(const remote::frame& request, int /*file*/) {
     }
   }
   if (told.done.result == TEEC_SUCCESS) {
-    told.done.result = core_.world->open_session(from_bytes(asked.ta), client, memory.types(), memory.params(),
-                                                 told.session, told.done.origin);
+    take_turn(told.done, [&] {
+      told.done.result = core_.world->open_session(from_bytes(asked.ta), client, memory.types(), memory.params(),
+                                                   told.session, told.done.origin);
+    });
     if (told.done.result == TEEC_SUCCESS) sessions_.push_back(told.session);
     told.params = memory.answer(told.done.origin == TEEC_ORIGIN_TRUSTED_APP);
   }
@@ -81,8 +94,10 @@ bool connection::invoke(const remote::frame& request, int /*file*/) {
   call_memory memory(scratch_);
   if (owns(asked.session)) told.done.result = memory.take(asked.params, blocks_);
   if (told.done.result == TEEC_SUCCESS) {
-    told.done.result =
-        core_.world->invoke(asked.session, asked.command, memory.types(), memory.params(), told.done.origin);
+    take_turn(told.done, [&] {
+      told.done.result =
+          core_.world->invoke(asked.session, asked.command, memory.types(), memory.params(), told.done.origin);
+    });
     told.params = memory.answer(told.done.origin == TEEC_ORIGIN_TRUSTED_APP);
   }
   answer(request, told);

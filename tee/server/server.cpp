@@ -20,6 +20,9 @@ constexpr int breather_ms = 50;
 
 constexpr int most_a_round = 64;
 
+// How long a client's thread may take for what can take any time, when the server ends.
+constexpr auto between_nudges = std::chrono::milliseconds(20);
+
 [[noreturn]] void fail(const char* what) {
   throw std::system_error(errno, std::generic_category(), what);
 }
@@ -38,14 +41,6 @@ void signal_to(int wake) noexcept {
 void clear(int wake) noexcept {
   std::uint64_t count = 0;
   (void)!::read(wake, &count, sizeof count);
-}
-
-// A newcomer's queue is empty: this does not wait.
-void turn_away(int socket) {
-  std::array<std::uint8_t, remote::header_size + sizeof(std::uint32_t)> room{};
-  remote::frame_builder builder(room, remote::refused_kind, 0);
-  remote::write_body(builder.body(), remote::refusal_answer{remote::refusal::crowded});
-  (void)send_packet(socket, builder.finish());
 }
 
 }  // namespace
@@ -80,7 +75,7 @@ bool server::wait(int also_stops) {
 void server::run(int also_stops) {
   while (wait(also_stops)) accept_some();
   if (on_stopping_) on_stopping_();
-  listener_ = {};  // who still waits there is told at once
+  closer_.take_over(std::move(listener_));  // who still waits there is told at once
   end_all();
   core_.world.reset();
 }
@@ -114,27 +109,45 @@ bool server::has_room_for(const peer& newcomer) {
   }
   const server_limits& limits = core_.limits;
   const std::uint32_t kept = newcomer.may_manage() ? 0 : limits.connections_kept;
-  return clients_.size() + kept < limits.connections && of_user < limits.connections_per_user &&
-         of_process < limits.connections_per_process;
+  const bool has_room = clients_.size() + kept < limits.connections && of_user < limits.connections_per_user &&
+                        of_process < limits.connections_per_process;
+  if (!has_room) hurry_those_who_close();
+  return has_room;
+}
+
+// Places are not kept by what takes its time.
+void server::hurry_those_who_close() {
+  for (client& known : clients_) {
+    if (known.leaves || known.link.closes()) nudge(known.thread);
+  }
+}
+
+// A newcomer has been sent nothing yet: this does not wait.
+void server::turn_away(file_descriptor socket) {
+  std::array<std::uint8_t, remote::header_size + sizeof(std::uint32_t)> room{};
+  remote::frame_builder builder(room, remote::refused_kind, 0);
+  remote::write_body(builder.body(), remote::refusal_answer{remote::refusal::crowded});
+  (void)send_packet(socket.get(), builder.finish());
+  closer_.take_over(std::move(socket));
+  ++core_.counters.refused;
 }
 
 // A newcomer costs little before it is known that there is room for it.
 void server::take_in(file_descriptor socket) {
-  const int raw = socket.get();
   client_list fresh;
   try {
-    peer newcomer(raw);
+    peer newcomer(socket.get());
     reap();
     if (has_room_for(newcomer)) {
       fresh.emplace_back(std::move(socket), std::move(newcomer), core_);
       start(fresh);
       return;
     }
-    turn_away(raw);
   } catch (const std::exception&) {
-    if (!fresh.empty()) turn_away(raw);  // want of threads. Of memory: its socket is closed, and the others go on.
+    // Want of memory or of threads: the others go on.
+    if (!fresh.empty()) socket = fresh.front().link.take_socket();
   }
-  ++core_.counters.refused;
+  turn_away(std::move(socket));
 }
 
 // Throws when there can be no more threads; `fresh` has its client still.
@@ -150,6 +163,13 @@ void server::serve(client_list::iterator place) {
   ++core_.counters.connections;
   place->link.serve();
   --core_.counters.connections;
+  file_descriptor socket;
+  {
+    const std::scoped_lock lock(mutex_);
+    if (!core_.stopping) socket = place->link.take_socket();
+    place->leaves = true;
+  }
+  socket = {};  // in this thread and at the expense of this client's share of connections: it may take any time
   {
     const std::scoped_lock lock(mutex_);
     ended_.splice(ended_.end(), clients_, place);
@@ -173,7 +193,11 @@ void server::end_all() {
   core_.stopping = true;
   std::unique_lock lock(mutex_);
   for (client& known : clients_) known.link.end_soon();
-  has_ended_.wait(lock, [this] { return clients_.empty(); });
+  while (!has_ended_.wait_for(lock, between_nudges, [this] { return clients_.empty(); })) {
+    for (client& known : clients_) {
+      if (!known.link.works()) nudge(known.thread);
+    }
+  }
   lock.unlock();
   for (client& gone : ended_) {
     if (gone.thread.joinable()) gone.thread.join();

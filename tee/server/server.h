@@ -10,6 +10,7 @@
 #include <thread>
 
 #include "tee/runtime/file_descriptor.h"
+#include "tee/server/closing.h"
 #include "tee/server/connection.h"
 #include "tee/server/core.h"
 
@@ -45,6 +46,7 @@ class server {
     client(file_descriptor socket, peer who, server_core& core) : link(std::move(socket), std::move(who), core) {}
     connection link;
     std::thread thread;
+    bool leaves = false;  // its thread closes the socket
   };
   using client_list = std::list<client>;
 
@@ -52,12 +54,15 @@ class server {
   void accept_some();
   void take_in(file_descriptor socket);
   [[nodiscard]] bool has_room_for(const peer& newcomer);
+  void hurry_those_who_close();
   void start(client_list& fresh);
   void serve(client_list::iterator place);
   void reap();
+  void turn_away(file_descriptor socket);
   void end_all();
 
   server_core core_;
+  closer closer_;  // of what this thread must not wait for
   file_descriptor listener_;
   file_descriptor wake_;  // an eventfd: something to stop for, or a connection that has ended
   std::function<void()> on_stopping_;

@@ -81,7 +81,16 @@ TEEC_Result block_collection::add(int file, std::uint32_t size, std::uint32_t fl
 }
 
 bool block_collection::remove(std::uint32_t number) {
-  return blocks_.erase(number) != 0;
+  const auto found = blocks_.find(number);
+  if (found == blocks_.end()) return false;
+  found->second.memory.empty_file();
+  blocks_.erase(found);
+  return true;
+}
+
+void block_collection::remove_all() {
+  for (const auto& [number, held] : blocks_) held.memory.empty_file();
+  blocks_.clear();
 }
 
 std::optional<std::span<std::uint8_t>> block_collection::part(std::uint32_t number, std::uint32_t offset,

@@ -85,9 +85,13 @@ class block_collection {
   /// with a `file` of -1 not even for its descriptor.
   [[nodiscard]] TEEC_Result add(int file, std::uint32_t size, std::uint32_t flags, std::uint32_t& number);
 
-  /// remove answers whether there was such a block.
+  /// Whoever touches a page first pays for it, with a client's file as with any other: without this a client could keep
+  /// as many files as it likes that are filled at the server's expense. So what ends is emptied. remove answers whether
+  /// there was such a block.
   bool remove(std::uint32_t number);
+  void remove_all();
 
+  /// clear lets go of the blocks and leaves the files as they are.
   void clear() { blocks_.clear(); }
 
   /// part gives bytes of a block, for references in the directions of `flags`. Nothing when there is no such block, it

@@ -55,6 +55,10 @@ void frame_channel::use_slots(mapped_memory memory, slot_layout layout, side min
   memory_.emplace(slots{std::move(memory), asks ? answers : requests, asks ? requests : answers});
 }
 
+void frame_channel::empty_slots() {
+  if (memory_) memory_->memory.empty_file();
+}
+
 received frame_channel::take(std::span<std::uint8_t> room) {
   const std::optional<std::size_t> size = memory_->incoming.take(room);
   if (!size) return {arrival::unfit, 0, {}};

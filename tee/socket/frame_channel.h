@@ -31,6 +31,7 @@ class frame_channel {
 
   [[nodiscard]] int socket() const { return socket_.get(); }
   [[nodiscard]] bool is_open() const { return socket_.is_open(); }
+  [[nodiscard]] file_descriptor take_socket() { return std::move(socket_); }
   void close() { socket_ = file_descriptor(); }
 
   /// Slots are of use where there is a processor to watch them with.
@@ -42,6 +43,7 @@ class frame_channel {
   /// watches for as long as usual commands take.
   void use_slots(mapped_memory memory, slot_layout layout, side mine);
   [[nodiscard]] bool has_slots() const { return memory_.has_value(); }
+  void empty_slots();
 
   /// receive waits for the next frame, from wherever it comes. A wake-up without a frame, and what is in a slot and is
   /// none, are unfit.

@@ -11,8 +11,13 @@
 namespace hosted_tee {
 namespace {
 
-// One is all that a frame ever needs, and the control message's padding has room for a second.
-constexpr std::size_t control_size = CMSG_SPACE(sizeof(int));
+// One is all that a frame ever needs.
+constexpr std::size_t sent_control = CMSG_SPACE(sizeof(int));
+
+// The most that the system lets anyone send with a packet (its SCM_MAX_FD). What there was no room for it would close
+// itself, whatever that takes.
+constexpr std::size_t most_descriptors = 253;
+constexpr std::size_t received_control = CMSG_SPACE(most_descriptors * sizeof(int));
 
 [[noreturn]] void fail(int error, const std::string& what) {
   throw std::system_error(error, std::generic_category(), what);
@@ -82,7 +87,7 @@ class incoming_packet {
 
  private:
   iovec part_;
-  alignas(cmsghdr) std::array<std::uint8_t, control_size> control_;
+  alignas(cmsghdr) std::array<std::uint8_t, received_control> control_;
   msghdr message_{};
 };
 
@@ -122,7 +127,7 @@ int send_packet(int socket, std::span<const std::uint8_t> packet, int passed) {
   msghdr message{};
   message.msg_iov = &part;
   message.msg_iovlen = 1;
-  alignas(cmsghdr) std::array<std::uint8_t, control_size> control{};
+  alignas(cmsghdr) std::array<std::uint8_t, sent_control> control{};
   if (passed >= 0) {
     message.msg_control = control.data();
     message.msg_controllen = control.size();

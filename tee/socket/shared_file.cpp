@@ -24,6 +24,11 @@ mapped_memory::~mapped_memory() {
   if (!bytes_.empty()) ::munmap(bytes_.data(), bytes_.size());
 }
 
+// A file that the system does not let be emptied keeps its pages.
+void mapped_memory::empty_file() const {
+  if (!bytes_.empty()) (void)::madvise(bytes_.data(), bytes_.size(), MADV_REMOVE);
+}
+
 std::optional<mapped_memory> map_file(int fd, std::size_t size) {
   void* const place = ::mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
   if (place == MAP_FAILED) return std::nullopt;

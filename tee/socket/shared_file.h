@@ -25,6 +25,9 @@ class mapped_memory {
 
   [[nodiscard]] std::span<std::uint8_t> bytes() const { return bytes_; }
 
+  /// empty_file takes the pages away from the file, for all who have it: then they are zeros, and cost nobody memory.
+  void empty_file() const;
+
  private:
   friend std::optional<mapped_memory> map_file(int fd, std::size_t size);
   explicit mapped_memory(std::span<std::uint8_t> bytes) : bytes_(bytes) {}

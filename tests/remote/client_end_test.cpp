@@ -2,33 +2,15 @@
 #include <sys/mman.h>
 #include <sys/socket.h>
 
-#include <future>
-
+#include "tee/runtime/uuid.h"
 #include "tee/socket/packet_socket.h"
+#include "tests/remote/held_command.h"
 #include "tests/remote/server_fixture.h"
 
 namespace hosted_tee::testing {
 namespace {
 
 using remote::frame_kind;
-using namespace std::chrono_literals;
-
-/// A command of the first TA that runs until it is let go.
-class held_command {
- public:
-  explicit held_command(ta_script& script) {
-    script.invoke = [this](void*, std::uint32_t, std::uint32_t, TEE_Param*) {
-      begun_.set_value();
-      may_end_.get_future().wait();
-      return TEE_SUCCESS;
-    };
-  }
-  void wait_until_it_runs() { begun_.get_future().wait(); }
-  void let_go() { may_end_.set_value(); }
-
- private:
-  std::promise<void> begun_, may_end_;
-};
 
 class ClientEndTest : public ServerTest {
  protected:
@@ -126,6 +108,34 @@ TEST_F(ClientEndTest, AServerThatIsToldToEndFinishesTheCommandThatRuns) {
   server->join();
   EXPECT_EQ(closed, 2);
   EXPECT_FALSE(world->has_instance(first_ta::uuid));
+}
+
+TEST_F(ClientEndTest, AServerThatIsToldToEndBeginsNoCommandThatWaits) {
+  held_command command(first);
+  int opened = 0, begun = 0;
+  second.open = [&](auto&&...) { return ++opened, TEE_SUCCESS; };
+  second.invoke = [&](auto&&...) { return ++begun, TEE_SUCCESS; };
+  const auto client = greeted(), idle = greeted(), newcomer = greeted();
+  const std::uint32_t other_session = idle->must_open(second_ta::uuid);
+  client->send(
+      raw_frame(frame_kind::invoke, body_of(remote::invoke_request{client->must_open(first_ta::uuid), 5, {}})));
+  command.wait_until_it_runs();
+  idle->send(raw_frame(frame_kind::invoke, body_of(remote::invoke_request{other_session, 5, {}})));
+  newcomer->send(
+      raw_frame(frame_kind::open_session, body_of(remote::open_request{to_bytes(second_ta::uuid), 0, 0, {}})));
+  std::this_thread::sleep_for(std::chrono::milliseconds(50));  // they wait by now, most probably
+  server->stop();
+  command.let_go();
+  EXPECT_EQ(client->receive().kind, remote::answer_to(frame_kind::invoke));
+  const auto is_told_so = [](const raw_answer& answer, auto told) {
+    return !answer.kind || (remote::read_body(answer.body, told) && told.done.result == TEEC_ERROR_COMMUNICATION &&
+                            told.done.origin == TEEC_ORIGIN_COMMS);
+  };
+  EXPECT_TRUE(is_told_so(idle->receive(), remote::invoke_answer{}));
+  EXPECT_TRUE(is_told_so(newcomer->receive(), remote::open_answer{}));
+  server->join();
+  EXPECT_EQ(opened, 1);
+  EXPECT_EQ(begun, 0);
 }
 
 TEST_F(ClientEndTest, TheServersSocketFileGoesWithItUnlessAnotherHasTakenItsPlace) {

@@ -1,8 +1,8 @@
 // Clients that pass descriptors that nobody asked for, or that are not what they should be.
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 
 #include "tests/remote/server_fixture.h"
 
@@ -63,37 +63,6 @@ TEST_F(HostileDescriptorsTest, FilesThatCouldBeCutShortAreRefused) {
   expect_served();
 }
 
-/// A connection over the network with more sent than is taken, so that its last close waits for `patience`.
-file_descriptor lingering_socket(const file_descriptor& listener, std::chrono::seconds patience) {
-  sockaddr_in place{};
-  socklen_t length = sizeof place;
-  place.sin_family = AF_INET;
-  place.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-  EXPECT_EQ(::bind(listener.get(), reinterpret_cast<sockaddr*>(&place), length), 0);
-  EXPECT_EQ(::listen(listener.get(), 1), 0);
-  EXPECT_EQ(::getsockname(listener.get(), reinterpret_cast<sockaddr*>(&place), &length), 0);
-  file_descriptor socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  EXPECT_EQ(::connect(socket.get(), reinterpret_cast<sockaddr*>(&place), length), 0);
-  const bytes block(65536);
-  while (::send(socket.get(), block.data(), block.size(), MSG_DONTWAIT) > 0) {
-  }
-  const linger waits{1, static_cast<int>(patience.count())};
-  EXPECT_EQ(::setsockopt(socket.get(), SOL_SOCKET, SO_LINGER, &waits, sizeof waits), 0);
-  return socket;
-}
-
-TEST_F(HostileDescriptorsTest, ASocketThatLingersHoldsNobodyUp) {
-  const file_descriptor listener(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  file_descriptor socket = lingering_socket(listener, std::chrono::minutes(5));
-  const bytes frame = raw_frame(frame_kind::share_memory, body_of(remote::share_request{page, 1}));
-  ASSERT_EQ(send_packet(client->socket(), frame, socket.get()), 0);
-  socket = {};
-  client.reset();
-  EXPECT_TRUE(has_let_go());
-  server->stop();
-  server->join();
-}
-
 TEST_F(HostileDescriptorsTest, FilesOfOtherKindsAreRefused) {
   std::array<int, 2> pipe{};
   ASSERT_EQ(::pipe2(pipe.data(), O_CLOEXEC), 0);
@@ -146,6 +115,52 @@ TEST_F(HostileDescriptorsTest, WhoWantsToCutItsMemoryShortCant) {
   std::uint8_t written = 0;
   EXPECT_EQ(::pread(file.get(), &written, 1, 2 * page - 1), 1);
   EXPECT_EQ(written, 7);
+}
+
+/// How much memory the file takes.
+std::int64_t bytes_of(const file_descriptor& file) {
+  struct stat facts {};
+  EXPECT_EQ(::fstat(file.get(), &facts), 0);
+  return facts.st_blocks * std::int64_t{512};
+}
+
+// Pages belong to whoever touched them first, and a client may keep its file.
+TEST_F(HostileDescriptorsTest, WhatEndsIsEmptiedSoThatNoFileIsKeptAtTheServersExpense) {
+  first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param* params) {
+    std::memset(params[0].memref.buffer, 7, params[0].memref.size);
+    return TEE_SUCCESS;
+  };
+  const auto fill = [&](const file_descriptor& file) {
+    remote::request_slots slots{TEE_PARAM_TYPE_MEMREF_INOUT, {}};
+    const std::uint32_t block = share(file.get(), 4 * page, TEEC_MEM_INPUT | TEEC_MEM_OUTPUT).block;
+    slots.slots[0] = {0, 0, remote::memory_source::shared, 4 * page, block, 0, {}};
+    EXPECT_EQ(client->invoke(client->must_open(first_ta::uuid), slots).done.result, TEEC_SUCCESS);
+    EXPECT_EQ(bytes_of(file), 4 * page);
+    return block;
+  };
+  const file_descriptor released = made_file(4 * page, all_seals), left = made_file(4 * page, all_seals),
+                        slots = made_file(slot_layout{remote::frame_limit}.size(), all_seals),
+                        kept = made_file(4 * page, all_seals);
+  const std::uint32_t block = fill(released);
+  EXPECT_EQ(client->ask<remote::plain_answer>(frame_kind::release_memory, remote::release_request{block}).done.result,
+            TEEC_SUCCESS);
+  EXPECT_EQ(bytes_of(released), 0);
+  (void)fill(left);
+  if (frame_channel::wants_slots()) {
+    EXPECT_EQ(
+        client->ask<remote::plain_answer>(frame_kind::use_slots, remote::empty_request{}, {slots.get()}).done.result,
+        TEEC_SUCCESS);
+    EXPECT_TRUE(eventually([&] { return bytes_of(slots) > 0; }));  // the server looks for a request there
+  }
+  client.reset();
+  EXPECT_TRUE(has_let_go());
+  EXPECT_EQ(bytes_of(left), 0);
+  EXPECT_EQ(bytes_of(slots), 0);
+  // When the server ends, its clients go on with what they have.
+  client = greeted();
+  (void)fill(kept);
+  server.reset();
+  EXPECT_EQ(bytes_of(kept), 4 * page);
 }
 
 TEST_F(HostileDescriptorsTest, ReferencesStayInsideTheirBlockAndGoItsWay) {
