@@ -15,7 +15,7 @@ import sys
 import tempfile
 import unittest
 
-TOOLS = ("cpack", "dpkg-deb", "dpkg-shlibdeps", "dpkg-query", "ldconfig")
+TOOLS = ("cpack", "dpkg-deb", "dpkg-shlibdeps", "dpkg-query", "ldconfig", "pkg-config", "openssl")
 SKIPPED = 77
 
 
@@ -71,7 +71,7 @@ def can_enter_roots():
 
 
 class Packages(unittest.TestCase):
-    build = packages = None
+    source = build = packages = None
 
     @classmethod
     def setUpClass(cls):
@@ -111,9 +111,9 @@ class Packages(unittest.TestCase):
         told = run("lintian", "--fail-on", "error,warning", "--allow-root", self.runtime, self.development, check=False)
         self.assertEqual((told.returncode, told.stdout), (0, ""))
 
-    @unittest.skipIf(shutil.which("unshare") is None or not can_enter_roots(), "no root can be entered here")
-    def test_the_command_runs_in_a_root_with_its_dependencies_and_nothing_else(self):
-        root = self.packages / "root"
+    def clean_root(self):
+        """A root with what the runtime package depends on, and with it."""
+        root = pathlib.Path(tempfile.mkdtemp(dir=self.packages))
         for name in ("usr/lib", "usr/lib64", "usr/bin", "usr/sbin", "proc", "tmp", "etc"):
             (root / name).mkdir(parents=True)
         for name in ("lib", "lib64", "bin", "sbin"):
@@ -122,11 +122,19 @@ class Packages(unittest.TestCase):
             copy_package(name, root)
         run("dpkg-deb", "-x", self.runtime, root)
         run("ldconfig", "-r", root)  # what the package's trigger does
+        return root
+
+    @unittest.skipIf(shutil.which("unshare") is None or not can_enter_roots(), "no root can be entered here")
+    def test_the_commands_run_in_a_root_with_their_dependencies_and_nothing_else(self):
+        root = self.clean_root()
+        environment = {"PATH": os.environ["PATH"], "HOME": "/tmp", "LC_ALL": "C.UTF-8"}
+
+        def entering(*command):
+            return ["unshare", "--map-root-user", "--mount", "--pid", "--fork", "--kill-child",
+                    f"--mount-proc={root / 'proc'}", "chroot", root, *command]
 
         def inside(*command, check=True):
-            return run("unshare", "--map-root-user", "--mount", "--pid", "--fork", f"--mount-proc={root / 'proc'}",
-                       "chroot", root, *command, check=check,
-                       environment={"PATH": os.environ["PATH"], "HOME": "/tmp", "LC_ALL": "C.UTF-8"})
+            return run(*entering(*command), check=check, environment=environment)
 
         self.assertFalse((root / "usr/bin/sh").exists())  # no more than what was promised
         told = inside("/usr/bin/kmctl", "generate", "--size", "1024", "/tmp/key")
@@ -137,6 +145,31 @@ class Packages(unittest.TestCase):
         self.assertEqual(wrong.returncode, 6, wrong.stdout)
         self.assertIn("locked", inside("/usr/bin/kmctl", "device", "status").stdout)
 
+        # And so do the server, kmctl through it, and a program of somebody who has the development package too.
+        run("dpkg-deb", "-x", self.development, root)
+        folder, = root.glob("usr/lib/**/pkgconfig")
+        flags = run("pkg-config", "--cflags", "--libs", "keymaster-tee-client", environment={
+            **environment, "PKG_CONFIG_LIBDIR": str(folder), "PKG_CONFIG_SYSROOT_DIR": str(root)}).stdout.split()
+        example = self.source / "example/first_client.c"
+        # The linker looks for libraries of libraries in the system's own places, and not in this root's.
+        run("cc", "-std=c11", example, "-o", root / "tmp/first_client", *flags,
+            f"-Wl,-rpath-link,{folder.parent}")
+        teed = subprocess.Popen([str(word) for word in entering("/usr/bin/teed", "--state", "/tmp/state", "--socket",
+                                                                "/tmp/tee")],
+                                env=environment, stderr=subprocess.PIPE, text=True)
+        self.addCleanup(teed.stderr.close)
+        self.addCleanup(teed.wait)
+        self.addCleanup(teed.kill)
+        self.assertIn("serving", teed.stderr.readline())
+        through = ("/usr/bin/kmctl", "--tee", "unix:/tmp/tee")
+        self.assertIn("Generated", inside(*through, "generate", "--size", "1024", "/tmp/key2").stdout)
+        environment["KEYMASTER_TEE"] = "unix:/tmp/tee"
+        inside("/tmp/first_client", "/usr/bin/kmctl", "/tmp/signature2", "/tmp/public")
+        run("openssl", "dgst", "-sha256", "-verify", root / "tmp/public", "-keyform", "DER", "-signature",
+            root / "tmp/signature2", root / "usr/bin/kmctl")
+        inside(*through, "tee", "stop")
+        self.assertEqual(teed.wait(timeout=60), 0)
+
 
 if __name__ == "__main__":
     if len(sys.argv) < 3:
@@ -146,5 +179,6 @@ if __name__ == "__main__":
         print(f"skipped: there is no {', '.join(MISSING)}")
         sys.exit(SKIPPED)
     os.environ["PATH"] += ":/usr/sbin:/sbin"
+    Packages.source = pathlib.Path(sys.argv[1])
     Packages.build = sys.argv[2]
     unittest.main(argv=[sys.argv[0], *sys.argv[3:]], verbosity=1)

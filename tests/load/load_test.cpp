@@ -18,12 +18,6 @@ using clock = std::chrono::steady_clock;
 constexpr std::uint32_t clients = 64;
 constexpr std::size_t operation_places = 16;
 
-// Clients' buffers and stacks are there at both looks, and commands leave nothing. What the bound leaves room for is
-// how the allocator divides its arenas among threads that come and go. Between the looks at a minute's run there are
-// 300,000 commands and more: a leak of the least that the allocator gives (32 bytes) in each would be more than twice
-// the bound.
-[[maybe_unused]] constexpr std::size_t allowed_growth = 4 << 20;
-
 /// Clients that work until they are told to end.
 class crowd {
  public:
