@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <array>
+#include <limits>
 #include <string>
 #include <string_view>
 
@@ -19,8 +20,11 @@ namespace client = keymaster::client;
 using hosted_tee::server_management;
 
 constexpr const char* status_examples =
-    "Operations are the operation handles that a TA has open; heap is in bytes: in use, the most there ever was since\n"
-    "the TA's instance began, and the limit. Only the server's own user and root are answered.\n\n"
+    "Operations are the handles that a TA has open for its cryptography. They are not the operations of its\n"
+    "clients, which can't be seen from outside: the Keymaster TA has places for 16 of those, and each takes one\n"
+    "handle or two. Signatures of RSA and EC with a digest take two, all else takes one. Heap is in bytes: in use,\n"
+    "the most there ever was since the TA's instance began, and the limit. Only the server's own user and root are\n"
+    "answered.\n\n"
     "Examples:\n"
     "  export KEYMASTER_TEE=unix:/run/keymaster/teed.socket\n"
     "  kmctl tee status\n"
@@ -155,10 +159,8 @@ int run_log(const log_options& options, const context& ctx) {
   server_management server;
   connect(server, ctx);
   hosted_tee::server_log log;
-  check(server.log(0, log), "tee_log", client::error_kind::companion);
-  if (options.lines != 0 && log.lines.size() > options.lines) {
-    log.lines.erase(log.lines.begin(), log.lines.end() - static_cast<std::ptrdiff_t>(options.lines));
-  }
+  const std::uint64_t most = options.lines != 0 ? options.lines : std::numeric_limits<std::uint64_t>::max();
+  check(server.latest_log(most, log), "tee_log", client::error_kind::companion);
   std::string text;
   json lines = json::array();
   for (const auto& line : log.lines) {

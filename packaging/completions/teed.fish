@@ -9,4 +9,4 @@ complete -c teed -l trace -x -a 'error info debug' -d 'print the trace on standa
 complete -c teed -l keep-trace -x -a 'error info debug' -d 'what to keep of the trace for kmctl tee log'
 complete -c teed -l max-connections -x -d 'connections at once'
 complete -c teed -l max-sessions -x -d 'sessions of a connection'
-complete -c teed -l max-memory -x -d 'shared memory of a connection, in MiB'
+complete -c teed -l max-memory -x -d 'shared memory of a process, in MiB'

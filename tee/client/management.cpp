@@ -1,5 +1,6 @@
 #include "tee/client/management.h"
 
+#include <algorithm>
 #include <new>
 #include <string_view>
 
@@ -89,25 +90,41 @@ request_channel& server_management::requests() {
   return channel_->requests;
 }
 
+remote::status_answer server_management::asked_status() {
+  remote::status_answer answer;
+  requests().ask(frame_kind::status, remote::empty_request{}, answer);
+  expect(answer.done);
+  return answer;
+}
+
 management_failure server_management::status(server_status& out) {
-  return guarded([&] {
-    remote::status_answer answer;
-    requests().ask(frame_kind::status, remote::empty_request{}, answer);
+  return guarded([&] { out = to_status(asked_status()); });
+}
+
+// A trace may grow faster than it is read, and forget lines that were to come: neither moves the end.
+void server_management::read_lines(std::uint64_t from, std::uint64_t end, server_log& out) {
+  out = {{}, from};
+  for (bool at_end = false; !at_end && out.next < end;) {
+    remote::log_answer answer;
+    requests().ask(frame_kind::log, remote::log_request{out.next}, answer);
     expect(answer.done);
-    out = to_status(answer);
-  });
+    if (!answer.at_end && answer.next <= out.next) requests().break_off();
+    for (const auto& line : answer.lines) {
+      if (line.number < end) out.lines.push_back(to_line(line));
+    }
+    out.next = std::min(answer.next, end);
+    at_end = answer.at_end;
+  }
 }
 
 management_failure server_management::log(std::uint64_t from, server_log& out) {
+  return guarded([&] { read_lines(from, asked_status().trace_total, out); });
+}
+
+management_failure server_management::latest_log(std::uint64_t count, server_log& out) {
   return guarded([&] {
-    out = {{}, from};
-    remote::log_answer answer;
-    do {
-      requests().ask(frame_kind::log, remote::log_request{out.next}, answer);
-      expect(answer.done);
-      for (const auto& line : answer.lines) out.lines.push_back(to_line(line));
-      out.next = answer.next;
-    } while (!answer.at_end);
+    const std::uint64_t end = asked_status().trace_total;
+    read_lines(end - std::min(count, end), end, out);
   });
 }
 

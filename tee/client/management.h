@@ -12,6 +12,9 @@
 namespace hosted_tee {
 
 class request_channel;
+namespace remote {
+struct status_answer;
+}
 
 /// One live instance of a TA, with what it holds.
 struct ta_status {
@@ -77,8 +80,11 @@ class server_management {
 
   [[nodiscard]] management_failure status(server_status& out);
 
-  /// log gives the lines from number `from` on that are still there.
+  /// log gives the lines from number `from` on that are there when it is asked, without those that the trace has
+  /// forgotten or forgets meanwhile; latest_log the last `count` of them. What is traced later is not waited for: it
+  /// follows from out.next on.
   [[nodiscard]] management_failure log(std::uint64_t from, server_log& out);
+  [[nodiscard]] management_failure latest_log(std::uint64_t count, server_log& out);
 
   /// stop asks the server to end, and waits until it has.
   [[nodiscard]] management_failure stop();
@@ -86,6 +92,8 @@ class server_management {
  private:
   struct channel;
   [[nodiscard]] request_channel& requests();
+  [[nodiscard]] remote::status_answer asked_status();
+  void read_lines(std::uint64_t from, std::uint64_t end, server_log& out);
 
   std::unique_ptr<channel> channel_;
 };

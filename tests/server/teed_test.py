@@ -251,6 +251,45 @@ class ManagementTest(TeedTest):
         self.assertEqual((now["sessions"], now["refused"], now["dropped"]), (0, 0, 0))
         self.assertIn(str(teed.pid), self.kmctl("tee", "status").stdout)
 
+    def holding(self, *arguments):
+        """Starts kmctl, which begins what it is told and waits for data until its input is closed."""
+        process = subprocess.Popen([KMCTL, "--tee", "unix:" + self.socket, *arguments], stdin=subprocess.PIPE,
+                                   stdout=subprocess.DEVNULL, env=environment(), cwd=self.folder)
+        self.addCleanup(process.wait)
+        self.addCleanup(process.stdin.close)
+        return process
+
+    def test_the_status_tells_of_a_ta_what_it_holds_as_text_and_as_json(self):
+        self.start()
+        self.kmctl("generate", "key.blob")
+        holders = [self.holding("sign", "key.blob", "-", "-o", f"{n}.sig") for n in range(2)]
+        wait_until(lambda: [ta["operations"] for ta in self.status()["tas"]] == [4])
+        now = self.status()
+        ta = now["tas"][0]
+        # Each signature takes a session, a handle for the digest and one for RSA, and its key beside the TA's own
+        # three: two that seal blobs, one that checks tokens.
+        self.assertEqual((ta["sessions"], ta["operations"], ta["transient_objects"], ta["persistent_objects"]),
+                         (2, 4, 5, 0))
+        self.assertEqual(ta["heap_limit"], 512 * 1024)
+        self.assertTrue(0 < ta["heap"] < ta["heap_peak"] < ta["heap_limit"], ta)
+        told = [(line[:20].rstrip(), line[20:]) for line in self.kmctl("tee", "status").stdout.splitlines()]
+        rows = (("teed", now["version"]), ("state", now["state"]), ("process", now["pid"]), ("up for ms", None),
+                ("connections", None), ("  accepted", None), ("  refused", now["refused"]),
+                ("  dropped", now["dropped"]), ("sessions", now["sessions"]), ("commands", now["commands"]),
+                ("shared blocks", now["shared_blocks"]), ("shared bytes", now["shared_bytes"]),
+                ("trace lines", now["trace_lines"]), ("  since start", now["trace_total"]), ("TA", ta["ta"]),
+                ("  sessions", ta["sessions"]), ("  operations", ta["operations"]), ("  heap", ta["heap"]),
+                ("  heap peak", ta["heap_peak"]), ("  heap limit", ta["heap_limit"]),
+                ("  keys in memory", ta["transient_objects"]), ("  open objects", ta["persistent_objects"]))
+        self.assertEqual([title for title, _ in told], [title for title, _ in rows])
+        for (title, text), (_, number) in zip(told, rows):
+            if number is not None:  # else it is another one with each look
+                self.assertEqual(text, str(number), title)
+        for holder in holders:
+            holder.stdin.close()
+            self.assertEqual(holder.wait(timeout=30), DONE)
+        wait_until(lambda: self.status()["tas"] == [])
+
     def test_an_embedded_device_is_no_server(self):
         for command in ("status", "log", "stop"):
             result = subprocess.run([KMCTL, "--state", self.state, "tee", command], capture_output=True, text=True,
