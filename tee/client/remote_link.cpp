@@ -38,6 +38,12 @@ shared_file made_file(std::size_t size) {
 
 }  // namespace
 
+// In a forked child the mutex may be held by a thread that only the parent has.
+std::unique_lock<std::mutex> remote_link::lock() {
+  channel_.check_owner();
+  return std::unique_lock(mutex_);
+}
+
 known_memory remote_link::make_known(std::size_t size, std::uint32_t flags) {
   shared_file made = made_file(size);
   remote::share_answer answer;
@@ -61,8 +67,12 @@ void remote_link::give_back(std::uint32_t block) noexcept {
 }
 
 void remote_link::forget(std::uint32_t block) noexcept {
-  const std::scoped_lock lock(mutex_);
-  give_back(block);
+  try {
+    const auto mine = lock();
+    release(block);
+  } catch (const std::exception&) {
+    // The server is gone, or it is the parent who shares it.
+  }
 }
 
 known_memory& remote_link::staging(std::size_t size) {
@@ -83,7 +93,7 @@ void remote_link::tidy_staging() noexcept {
 TEEC_Result remote_link::open_session(const TEE_UUID& ta, std::uint32_t method, const void* connection_data,
                                       client_params& params, std::uint32_t& session, std::uint32_t& origin) {
   const std::uint32_t group = group_of(method, connection_data);
-  const std::scoped_lock lock(mutex_);
+  const auto mine = lock();
   parcel sent(params, [this](std::size_t size) -> known_memory& { return staging(size); });
   remote::open_answer answer;
   channel_.ask(frame_kind::open_session, remote::open_request{to_bytes(ta), method, group, sent.slots()}, answer);
@@ -97,7 +107,7 @@ TEEC_Result remote_link::open_session(const TEE_UUID& ta, std::uint32_t method, 
 
 TEEC_Result remote_link::invoke(std::uint32_t session, std::uint32_t command, client_params& params,
                                 std::uint32_t& origin) {
-  const std::scoped_lock lock(mutex_);
+  const auto mine = lock();
   parcel sent(params, [this](std::size_t size) -> known_memory& { return staging(size); });
   remote::invoke_answer answer;
   channel_.ask(frame_kind::invoke, remote::invoke_request{session, command, sent.slots()}, answer);
@@ -109,18 +119,18 @@ TEEC_Result remote_link::invoke(std::uint32_t session, std::uint32_t command, cl
 }
 
 void remote_link::close_session(std::uint32_t session) {
-  const std::scoped_lock lock(mutex_);
+  const auto mine = lock();
   remote::plain_answer answer;
   channel_.ask(frame_kind::close_session, remote::close_request{session}, answer);
 }
 
 std::unique_ptr<shared_block> remote_link::share_own(const TEEC_SharedMemory& memory) {
-  const std::scoped_lock lock(mutex_);
+  const auto mine = lock();
   return std::make_unique<remote_block>(*this, make_known(memory.size, memory.flags), memory);
 }
 
 std::unique_ptr<shared_block> remote_link::share_new(const TEEC_SharedMemory& memory) {
-  const std::scoped_lock lock(mutex_);
+  const auto mine = lock();
   return std::make_unique<remote_block>(*this, make_known(memory.size, memory.flags));
 }
 

@@ -39,6 +39,7 @@ class remote_link final : public tee_link {
   void forget(std::uint32_t block) noexcept;
 
  private:
+  [[nodiscard]] std::unique_lock<std::mutex> lock();
   [[nodiscard]] known_memory make_known(std::size_t size, std::uint32_t flags);
   [[nodiscard]] known_memory& staging(std::size_t size);
   void tidy_staging() noexcept;  // after an answer, which nothing may take back

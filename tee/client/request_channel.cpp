@@ -74,6 +74,11 @@ void request_channel::make_slots() {
   }
 }
 
+// The connection stays the parent's: two processes on it would take each other's answers.
+void request_channel::check_owner() const {
+  if (owner_ != ::getpid()) fail(TEEC_ERROR_COMMUNICATION);
+}
+
 void request_channel::break_off() {
   channel_.close();
   fail(TEEC_ERROR_COMMUNICATION);
@@ -89,8 +94,8 @@ void request_channel::explain_refusal(const remote::frame& refused) {
 std::span<const std::uint8_t> request_channel::exchange(std::span<const std::uint8_t> request, remote::frame_kind kind,
                                                         int passed) {
   if (request.empty()) fail(TEEC_ERROR_EXCESS_DATA);
-  // The connection stays the parent's: two processes on it would take each other's answers.
-  if (!channel_.is_open() || owner_ != ::getpid()) fail(TEEC_ERROR_COMMUNICATION);
+  check_owner();
+  if (!channel_.is_open()) fail(TEEC_ERROR_COMMUNICATION);
   // A server that refuses the connection is gone before it is asked: what it said first is still there to be read.
   const bool by_slot = channel_.has_slots() && passed < 0;
   const int error = by_slot ? channel_.put(request) : channel_.send(request, passed);

@@ -36,6 +36,9 @@ class request_channel {
     if (!remote::read_body(exchange(builder.finish(), kind, passed), answer)) break_off();
   }
 
+  /// check_owner throws TEEC_ERROR_COMMUNICATION in a process that was forked from the one that connected.
+  void check_owner() const;
+
   /// break_off is for an answer that can't be one to the request: TEEC_ERROR_COMMUNICATION.
   [[noreturn]] void break_off();
 

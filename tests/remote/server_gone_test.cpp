@@ -1,11 +1,11 @@
 // Clients whose server is gone, or is none.
-#include <fcntl.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
 
+#include "tests/remote/false_server.h"
+#include "tests/remote/held_command.h"
 #include "tests/remote/server_fixture.h"
 
 namespace hosted_tee::testing {
@@ -61,57 +61,60 @@ TEST_F(ServerGoneTest, NamesThatNoSocketCanHaveAreBadParameters) {
   }
 }
 
+/// holds_in_a_child tells whether something is so in a forked process. One that waits for a thread it does not have is
+/// ended by the alarm.
+bool holds_in_a_child(const std::function<bool()>& holds) {
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::alarm(20);
+    ::_exit(holds() ? 0 : 1);
+  }
+  int state = -1;
+  return ::waitpid(child, &state, 0) == child && state == 0;
+}
+
 TEST_F(ServerGoneTest, AForkedChildLeavesTheConnectionToItsParent) {
   serve();
   ASSERT_EQ(initialize(), TEEC_SUCCESS);
   ASSERT_EQ(open(), TEEC_SUCCESS);
-  const pid_t child = ::fork();
-  if (child == 0) ::_exit(invoke() == TEEC_ERROR_COMMUNICATION ? 0 : 1);
-  int state = -1;
-  ASSERT_EQ(::waitpid(child, &state, 0), child);
-  EXPECT_EQ(state, 0);
+  EXPECT_TRUE(holds_in_a_child([this] { return invoke() == TEEC_ERROR_COMMUNICATION && origin == TEEC_ORIGIN_COMMS; }));
   EXPECT_EQ(invoke(), TEEC_SUCCESS);
 }
 
-/// A server whose answers a test writes. It serves one connection.
-class false_server {
- public:
-  explicit false_server(const std::string& path) : file_(path, 0600), listener_(file_.take()) {}
-  ~false_server() { thread_.join(); }
-  false_server(const false_server&) = delete;
-  false_server& operator=(const false_server&) = delete;
+TEST_F(ServerGoneTest, AForkedChildDoesNotWaitForACallOfItsParentsThread) {
+  serve();
+  ASSERT_EQ(initialize(), TEEC_SUCCESS);
+  ASSERT_EQ(open(), TEEC_SUCCESS);
+  TEEC_SharedMemory shared{nullptr, 10, TEEC_MEM_INPUT, {}};
+  ASSERT_EQ(TEEC_AllocateSharedMemory(&context, &shared), TEEC_SUCCESS);
+  held_command command(first);
+  std::thread calling([this] { EXPECT_EQ(invoke(), TEEC_SUCCESS); });
+  command.wait_until_it_runs();
 
-  /// After an honest hello, and a refusal to use slots, it answers every request with what `answer` gives for it;
-  /// nothing closes the connection.
-  void run(std::function<bytes(const remote::frame&)> answer) {
-    thread_ = std::thread([this, answer = std::move(answer)] {
-      ::fcntl(listener_.get(), F_SETFL, 0);
-      const file_descriptor peer(::accept(listener_.get(), nullptr, nullptr));
-      bytes room(remote::frame_limit);
-      for (ssize_t size = 0; (size = ::recv(peer.get(), room.data(), room.size(), 0)) > 0;) {
-        remote::frame request;
-        if (!remote::read_frame({room.data(), static_cast<std::size_t>(size)}, request)) return;
-        const bytes told =
-            request.header.kind == 1 || request.header.kind == 7 ? honest_answer(request) : answer(request);
-        if (told.empty()) return;
-        if (::send(peer.get(), told.data(), told.size(), MSG_NOSIGNAL) < 0) return;
-      }
-    });
-  }
+  std::uint32_t told = 99;
+  TEEC_Session another{};
+  char byte = 0;
+  TEEC_SharedMemory more{&byte, 1, TEEC_MEM_INPUT, {}};
+  const auto fails = [](TEEC_Result result) { return result == TEEC_ERROR_COMMUNICATION; };
+  EXPECT_TRUE(holds_in_a_child(
+      [&] { return fails(TEEC_InvokeCommand(&session, 5, nullptr, &told)) && told == TEEC_ORIGIN_COMMS; }));
+  EXPECT_TRUE(holds_in_a_child([&] {
+    return fails(TEEC_OpenSession(&context, &another, &ta, 0, nullptr, nullptr, &told)) && told == TEEC_ORIGIN_COMMS;
+  }));
+  EXPECT_TRUE(holds_in_a_child([&] { return fails(TEEC_RegisterSharedMemory(&context, &more)); }));
+  EXPECT_TRUE(holds_in_a_child([&] { return fails(TEEC_AllocateSharedMemory(&context, &more)); }));
+  EXPECT_TRUE(holds_in_a_child([&] { return TEEC_ReleaseSharedMemory(&shared), shared.buffer == nullptr; }));
+  EXPECT_TRUE(holds_in_a_child([&] { return TEEC_CloseSession(&session), session.imp == nullptr; }));
 
- private:
-  static bytes honest_answer(const remote::frame& request) {
-    if (request.header.kind == 1) {
-      return raw_frame(std::uint16_t{0x8001}, body_of(remote::hello_answer{}), request.header.sequence);
-    }
-    const remote::plain_answer no{{TEEC_ERROR_NOT_SUPPORTED, TEEC_ORIGIN_COMMS}};
-    return raw_frame(std::uint16_t{0x8007}, body_of(no), request.header.sequence);
-  }
-
-  listening_socket file_;
-  file_descriptor listener_;
-  std::thread thread_;
-};
+  command.let_go();
+  calling.join();
+  first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) { return TEE_SUCCESS; };
+  EXPECT_EQ(invoke(), TEEC_SUCCESS);
+  const server_status now = status();
+  EXPECT_EQ(now.sessions, 1U);
+  EXPECT_EQ(now.shared_blocks, 1U);
+  TEEC_ReleaseSharedMemory(&shared);
+}
 
 TEST_F(ServerGoneTest, AnAnswerThatDoesNotBelongToTheRequestEndsTheConnection) {
   const remote::open_answer sound{{0, 4}, 1, {}};
