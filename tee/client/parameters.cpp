@@ -38,6 +38,11 @@ TEE_Param memory(void* buffer, std::size_t size) {
   return slot;
 }
 
+// A null buffer alone makes the null reference (Client API 1.0, 4.3.6): its size is not looked at.
+TEE_Param temporary(const TEEC_TempMemoryReference& given) {
+  return memory(given.buffer, given.buffer == nullptr ? 0 : given.size);
+}
+
 const shared_block& block_of(const TEEC_RegisteredMemoryReference& reference, const tee_link& link) {
   const auto& block = *static_cast<const shared_block*>(reference.parent->imp.block);
   if (block.owner().get() != &link) bad_parameters();
@@ -76,7 +81,7 @@ client_params::client_params(TEEC_Operation* operation, const tee_link& link) : 
       slots_[i].value.a = given.value.a;
       slots_[i].value.b = given.value.b;
     } else if (is_temporary(type)) {
-      slots_[i] = memory(given.tmpref.buffer, given.tmpref.size);
+      slots_[i] = temporary(given.tmpref);
     } else if (is_registered(type)) {
       slots_[i] = part(given.memref, type);
       blocks_[i] = &block_of(given.memref, link);

@@ -41,9 +41,11 @@ typedef struct {
   } imp;
 } TEEC_SharedMemory;
 
+/// Memory of the client's own for one operation. A null `buffer` makes the null reference, whatever `size` says: the TA
+/// sees a null pointer and no bytes. Of an output, `size` is afterwards what the TA left there.
 typedef struct {
   void* buffer;
-  size_t size;
+  size_t size;  ///< in bytes
 } TEEC_TempMemoryReference;
 
 typedef struct {

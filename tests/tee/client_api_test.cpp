@@ -6,6 +6,7 @@
 #include <array>
 #include <csignal>
 #include <fstream>
+#include <limits>
 
 #include "tee/client/connection.h"
 #include "tee/client/default_folder.h"
@@ -139,6 +140,29 @@ TEST_P(ClientTest, TemporaryMemoryTellsItsSizeAlsoWhenItWasTooSmall) {
   EXPECT_EQ(out[0], 'o');
 }
 
+TEST_P(ClientTest, ANullBufferAloneMakesANullReference) {
+  operation.paramTypes =
+      TEEC_PARAM_TYPES(TEEC_MEMREF_TEMP_INPUT, TEEC_MEMREF_TEMP_OUTPUT, TEEC_MEMREF_TEMP_INOUT, TEEC_NONE);
+  for (const std::size_t size : {std::size_t{1}, std::size_t{1} << 20, std::numeric_limits<std::size_t>::max()}) {
+    for (auto& p : operation.params) p.tmpref = {nullptr, size};
+    bool is_reached = false;
+    expect(0x0765, TEE_SUCCESS, [&](TEE_Param* params) {
+      for (int i = 0; i < 3; ++i) {
+        EXPECT_EQ(params[i].memref.buffer, nullptr);
+        EXPECT_EQ(params[i].memref.size, 0U);
+      }
+      params[1].memref.size = 16;
+      is_reached = true;
+    });
+    EXPECT_EQ(invoke(), TEEC_SUCCESS);
+    EXPECT_EQ(origin, TEEC_ORIGIN_TRUSTED_APP);
+    EXPECT_TRUE(is_reached);
+    EXPECT_EQ(operation.params[0].tmpref.size, size);
+    EXPECT_EQ(operation.params[1].tmpref.size, 16U);
+    EXPECT_EQ(operation.params[2].tmpref.size, 0U);
+  }
+}
+
 TEST_P(ClientTest, MemoryThatCantBeIsRefusedByTheApiItself) {
   char byte = 0;
   first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) { return ADD_FAILURE(), TEE_SUCCESS; };
@@ -147,14 +171,18 @@ TEST_P(ClientTest, MemoryThatCantBeIsRefusedByTheApiItself) {
     operation.params[0].tmpref = {&byte, static_cast<std::size_t>(std::uint64_t{1} << 32)};
     EXPECT_EQ(invoke(), TEEC_ERROR_EXCESS_DATA);
   }
-  operation.params[0].tmpref = {nullptr, 1};
-  EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS);
   operation.paramTypes = TEEC_MEMREF_WHOLE;
   TEEC_SharedMemory unregistered{&byte, 1, TEEC_MEM_INPUT, {}};
   for (TEEC_SharedMemory* parent : {&unregistered, static_cast<TEEC_SharedMemory*>(nullptr)}) {
     operation.params[0].memref = {parent, 1, 0};
     EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS);
   }
+  TEEC_SharedMemory shared{&byte, 1, TEEC_MEM_INPUT, {}};
+  ASSERT_EQ(TEEC_RegisterSharedMemory(&context, &shared), TEEC_SUCCESS);
+  shared.buffer = nullptr;  // shared memory is never the null reference
+  operation.params[0].memref = {&shared, 1, 0};
+  EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS);
+  TEEC_ReleaseSharedMemory(&shared);
   for (const std::uint32_t type : {0x4U, 0x8U, 0x9U, 0xAU, 0xBU, 0x10000U}) {
     operation.paramTypes = type;
     EXPECT_EQ(invoke(), TEEC_ERROR_BAD_PARAMETERS) << type;
