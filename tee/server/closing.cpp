@@ -53,13 +53,20 @@ void closer::take_over(file_descriptor descriptor) {
   while (!has_gone_.wait_for(lock, between_nudges, [this] { return waiting_.size() <= most_waiting; })) nudge(thread_);
 }
 
+bool closer::hurry() {
+  const std::scoped_lock lock(mutex_);
+  if (waiting_.empty()) return false;
+  nudge(thread_);
+  return true;
+}
+
 void closer::work() {
   std::unique_lock lock(mutex_);
   for (;;) {
     has_come_.wait(lock, [this] { return is_ending_ || !waiting_.empty(); });
     if (waiting_.empty()) break;
-    file_descriptor next = std::move(waiting_.back());
-    waiting_.pop_back();
+    file_descriptor next = std::move(waiting_.front());
+    waiting_.erase(waiting_.begin());
     lock.unlock();
     next = {};
     lock.lock();

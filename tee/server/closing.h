@@ -32,6 +32,9 @@ class closer {
   /// closings that take their time are cut short then.
   void take_over(file_descriptor descriptor);
 
+  /// hurry cuts short what others wait behind. False: nobody waits.
+  bool hurry();
+
  private:
   void work();
 

@@ -20,6 +20,9 @@ constexpr int breather_ms = 50;
 
 constexpr int most_a_round = 64;
 
+// How long who was turned away waits for the end of a connection before it that takes its time to close.
+constexpr int hurry_ms = 5;
+
 // How long a client's thread may take for what can take any time, when the server ends.
 constexpr auto between_nudges = std::chrono::milliseconds(20);
 
@@ -55,8 +58,10 @@ server::server(server_options options)
   if (::fcntl(listener_.get(), F_SETFL, O_NONBLOCK) != 0) fail("the listening socket");
 }
 
+// What clients have left unread at the end is closed as at any other time.
 server::~server() {
   end_all();
+  for (client& gone : ended_) closer_.take_over(gone.link.take_socket());
 }
 
 void server::stop() noexcept {
@@ -67,7 +72,8 @@ void server::stop() noexcept {
 // False: it is time to end.
 bool server::wait(int also_stops) {
   std::array<pollfd, 3> watched{{{wake_.get(), POLLIN, 0}, {also_stops, POLLIN, 0}, {listener_.get(), POLLIN, 0}}};
-  if (::poll(watched.data(), watched.size(), -1) < 0 && errno != EINTR) fail("poll");
+  const int limit = closer_.hurry() ? hurry_ms : -1;
+  if (::poll(watched.data(), watched.size(), limit) < 0 && errno != EINTR) fail("poll");
   if ((watched[0].revents & POLLIN) != 0) clear(wake_.get());
   return !core_.stopping && watched[1].revents == 0;
 }

@@ -122,6 +122,22 @@ TEST_F(LingeringTest, PlacesAreNotKeptByWhatTakesItsTime) {
   }
 }
 
+TEST_F(LingeringTest, WhatIsUnreadWhenTheServerEndsDoesNotHoldItUp) {
+  serve();
+  held_command command(first);
+  const auto client = greeted(), stays = greeted();
+  const bytes frame =
+      raw_frame(frame_kind::invoke, body_of(remote::invoke_request{client->must_open(first_ta::uuid), 5, {}}));
+  client->send(frame);
+  command.wait_until_it_runs();
+  EXPECT_TRUE(client->send(share_frame(), {lingering().get(), lingering().get()}));
+  client->close();
+  server->stop();
+  command.let_go();
+  server.reset();
+  EXPECT_TRUE(stays->is_closed());
+}
+
 /// A server with clients that came before it looks.
 class EarlyTest : public LingeringTest {
  protected:
