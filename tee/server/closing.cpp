@@ -25,6 +25,13 @@ void prepare_nudges() {
   if (::sigaction(nudge_signal, &action, nullptr) != 0) {
     throw std::system_error(errno, std::generic_category(), "sigaction");
   }
+  // Whoever started this process may have blocked all signals. Threads have the mask of those that make them.
+  sigset_t nudges;
+  ::sigemptyset(&nudges);
+  ::sigaddset(&nudges, nudge_signal);
+  if (const int error = ::pthread_sigmask(SIG_UNBLOCK, &nudges, nullptr); error != 0) {
+    throw std::system_error(error, std::generic_category(), "pthread_sigmask");
+  }
 }
 
 void nudge(std::thread& thread) {

@@ -11,6 +11,8 @@ namespace hosted_tee {
 
 using remote::frame_kind;
 
+namespace {
+
 /// While one is there, the flag is set.
 class mark {
  public:
@@ -22,6 +24,14 @@ class mark {
  private:
   std::atomic<bool>& flag_;
 };
+
+std::vector<std::uint32_t> with_room(std::size_t count) {
+  std::vector<std::uint32_t> made;
+  made.reserve(count);
+  return made;
+}
+
+}  // namespace
 
 /// A kind of request: who carries it out, and with how many descriptors it comes.
 struct connection::request_row {
@@ -48,16 +58,16 @@ const connection::request_row* connection::find_row(std::uint16_t kind) {
   return row == rows.end() ? nullptr : row;
 }
 
-connection::connection(file_descriptor socket, peer client, server_core& core)
-    : channel_(std::move(socket)),
-      core_(core),
+// What may fail comes before the socket is taken.
+connection::connection(file_descriptor&& socket, peer client, server_core& core)
+    : core_(core),
       client_(std::move(client)),
       blocks_(core.limits, core.memory, {client_.user(), client_.process()}),
+      sessions_(with_room(core.limits.sessions)),
       request_room_(remote::frame_limit),
       answer_room_(remote::frame_limit),
-      scratch_(remote::frame_limit) {
-  sessions_.reserve(core.limits.sessions);
-}
+      scratch_(remote::frame_limit),
+      channel_(std::move(socket)) {}
 
 void connection::serve() noexcept {
   next step = next::drop;
@@ -106,15 +116,10 @@ connection::next connection::refuse(remote::refusal why) {
   return next::drop;
 }
 
-// The answer does not wait until what came with the request is closed.
+// What came with the request is closed behind the answer.
 connection::next connection::serve_one() {
-  received packet = channel_.receive(request_room_);
-  const next step = serve_packet(packet);
-  if (!packet.descriptors.empty()) {
-    const mark closing(closes_);
-    packet.descriptors.clear();
-  }
-  return step;
+  const received packet = channel_.receive(request_room_);
+  return serve_packet(packet);
 }
 
 connection::next connection::serve_packet(const received& packet) {

@@ -21,7 +21,7 @@ namespace hosted_tee {
 class connection {
  public:
   /// `client` is who is at the other end of `socket`. `core` outlives the connection.
-  connection(file_descriptor socket, peer client, server_core& core);
+  connection(file_descriptor&& socket, peer client, server_core& core);
   connection(const connection&) = delete;
   connection& operator=(const connection&) = delete;
   ~connection() = default;
@@ -35,9 +35,8 @@ class connection {
   /// end_soon, from any thread, has serve return after the request that it is working on.
   void end_soon();
 
-  /// Whether its thread closes what the client passed, which may take any time; and whether it carries out or answers a
-  /// request, in which it must not be disturbed.
-  [[nodiscard]] bool closes() const { return closes_; }
+  /// Whether its thread carries out or answers a request, or gives up what the client had. Else it waits for the
+  /// client, or closes what it passed, which may take any time: then the thread may be nudged.
   [[nodiscard]] bool works() const { return works_; }
 
   /// take_socket gives the socket away, before or after serve.
@@ -80,7 +79,6 @@ class connection {
     answer_ = builder.finish();
   }
 
-  frame_channel channel_;
   server_core& core_;
   peer client_;
   block_collection blocks_;
@@ -89,7 +87,8 @@ class connection {
   std::span<const std::uint8_t> answer_;
   bool has_greeted_ = false;
   bool asked_to_stop_ = false;
-  std::atomic<bool> works_{false}, closes_{false};
+  std::atomic<bool> works_{false};
+  frame_channel channel_;
 };
 
 }  // namespace hosted_tee

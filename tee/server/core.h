@@ -24,7 +24,7 @@ struct server_counters {
   std::atomic<std::uint64_t> dropped{0};
 };
 
-/// What is neither constant nor atomic may be called from any thread.
+/// `world` stays until all connections have ended. What is neither constant nor atomic, and `turn`, are for any thread.
 struct server_core {
   std::shared_ptr<secure_world> world;
   std::string state;  ///< the state folder, as it is told to those who ask

@@ -20,7 +20,7 @@ constexpr int breather_ms = 50;
 
 constexpr int most_a_round = 64;
 
-// How long who was turned away waits for the end of a connection before it that takes its time to close.
+// How often what takes its time to close is cut short, when somebody waits behind it.
 constexpr int hurry_ms = 5;
 
 // How long a client's thread may take for what can take any time, when the server ends.
@@ -60,6 +60,7 @@ server::server(server_options options)
 
 // What clients have left unread at the end is closed as at any other time.
 server::~server() {
+  closer_.take_over(std::move(listener_));
   end_all();
   for (client& gone : ended_) closer_.take_over(gone.link.take_socket());
 }
@@ -93,6 +94,10 @@ void server::accept_some() {
     file_descriptor socket(::accept4(listener_.get(), nullptr, nullptr, SOCK_CLOEXEC));
     const int error = socket.is_open() ? 0 : errno;
     if (error == EMFILE || error == ENFILE || error == ENOMEM || error == ENOBUFS) {
+      {
+        const std::scoped_lock lock(mutex_);
+        hurry_closings();
+      }
       pollfd wake{wake_.get(), POLLIN, 0};
       (void)::poll(&wake, 1, breather_ms);
     }
@@ -117,14 +122,18 @@ bool server::has_room_for(const peer& newcomer) {
   const std::uint32_t kept = newcomer.may_manage() ? 0 : limits.connections_kept;
   const bool has_room = clients_.size() + kept < limits.connections && of_user < limits.connections_per_user &&
                         of_process < limits.connections_per_process;
-  if (!has_room) hurry_those_who_close();
+  if (!has_room) hurry_closings();
   return has_room;
 }
 
-// Places are not kept by what takes its time.
-void server::hurry_those_who_close() {
+// With mutex_. Places and descriptors are not kept by closings that take their time. Whoever only waits for its client
+// goes on with that; so newcomers who are refused one after the other do not have all of them woken each time.
+void server::hurry_closings() {
+  const auto now = std::chrono::steady_clock::now();
+  if (now < next_hurry_) return;
+  next_hurry_ = now + std::chrono::milliseconds(hurry_ms);
   for (client& known : clients_) {
-    if (known.leaves || known.link.closes()) nudge(known.thread);
+    if (!known.link.works()) nudge(known.thread);
   }
 }
 
@@ -173,7 +182,6 @@ void server::serve(client_list::iterator place) {
   {
     const std::scoped_lock lock(mutex_);
     if (!core_.stopping) socket = place->link.take_socket();
-    place->leaves = true;
   }
   socket = {};  // in this thread and at the expense of this client's share of connections: it may take any time
   {
@@ -200,9 +208,8 @@ void server::end_all() {
   std::unique_lock lock(mutex_);
   for (client& known : clients_) known.link.end_soon();
   while (!has_ended_.wait_for(lock, between_nudges, [this] { return clients_.empty(); })) {
-    for (client& known : clients_) {
-      if (!known.link.works()) nudge(known.thread);
-    }
+    (void)closer_.hurry();
+    hurry_closings();
   }
   lock.unlock();
   for (client& gone : ended_) {

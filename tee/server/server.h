@@ -24,7 +24,7 @@ struct server_options {
   std::function<void()> on_stopping;  ///< called once, when the server begins to end; may be empty
 };
 
-/// One thread accepts and each connection has one of its own; commands are serialised by the world.
+/// One thread accepts, one closes, and each connection has one of its own; commands take turns.
 class server {
  public:
   /// Throws std::system_error.
@@ -43,10 +43,9 @@ class server {
 
  private:
   struct client {
-    client(file_descriptor socket, peer who, server_core& core) : link(std::move(socket), std::move(who), core) {}
+    client(file_descriptor&& socket, peer who, server_core& core) : link(std::move(socket), std::move(who), core) {}
     connection link;
     std::thread thread;
-    bool leaves = false;  // its thread closes the socket
   };
   using client_list = std::list<client>;
 
@@ -54,7 +53,7 @@ class server {
   void accept_some();
   void take_in(file_descriptor socket);
   [[nodiscard]] bool has_room_for(const peer& newcomer);
-  void hurry_those_who_close();
+  void hurry_closings();
   void start(client_list& fresh);
   void serve(client_list::iterator place);
   void reap();
@@ -70,6 +69,7 @@ class server {
   client_list clients_;
   client_list ended_;  // their threads are about to return
   std::condition_variable has_ended_;
+  std::chrono::steady_clock::time_point next_hurry_;
 };
 
 }  // namespace hosted_tee

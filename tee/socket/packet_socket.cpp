@@ -11,13 +11,10 @@
 namespace hosted_tee {
 namespace {
 
-// One is all that a frame ever needs.
-constexpr std::size_t sent_control = CMSG_SPACE(sizeof(int));
-
-// The most that the system lets anyone send with a packet (its SCM_MAX_FD). What there was no room for it would close
-// itself, whatever that takes.
-constexpr std::size_t most_descriptors = 253;
-constexpr std::size_t received_control = CMSG_SPACE(most_descriptors * sizeof(int));
+// One is all that a frame ever needs, and the control message's padding has room for a second. With room for as many as
+// can be sent a client could have the server hold them.
+constexpr std::size_t control_size = CMSG_SPACE(sizeof(int));
+constexpr std::size_t most_descriptors = 2;
 
 [[noreturn]] void fail(int error, const std::string& what) {
   throw std::system_error(error, std::generic_category(), what);
@@ -29,19 +26,20 @@ void limit(int socket, int option, std::chrono::seconds seconds) {
 }
 
 std::vector<file_descriptor> take_descriptors(msghdr& message) {
-  std::vector<file_descriptor> taken;
+  std::array<file_descriptor, most_descriptors> own;  // before anything can fail
+  std::size_t count = 0;
   for (cmsghdr* part = CMSG_FIRSTHDR(&message); part != nullptr; part = CMSG_NXTHDR(&message, part)) {
     if (part->cmsg_level != SOL_SOCKET || part->cmsg_type != SCM_RIGHTS) continue;
-    const std::size_t count = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
-    for (std::size_t i = 0; i < count; ++i) {
+    const std::size_t here = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
+    for (std::size_t i = 0; i < here && count < own.size(); ++i) {
       int fd = -1;
       std::memcpy(&fd, CMSG_DATA(part) + i * sizeof fd, sizeof fd);
-      taken.emplace_back(fd);
-      // Whoever sent a socket may have left it so that closing waits for the network, as long as it likes.
-      constexpr linger none{};
-      (void)::setsockopt(fd, SOL_SOCKET, SO_LINGER, &none, sizeof none);
+      own[count++] = file_descriptor(fd);
     }
   }
+  std::vector<file_descriptor> taken;
+  taken.reserve(count);
+  for (std::size_t i = 0; i < count; ++i) taken.push_back(std::move(own[i]));
   return taken;
 }
 
@@ -87,7 +85,7 @@ class incoming_packet {
 
  private:
   iovec part_;
-  alignas(cmsghdr) std::array<std::uint8_t, received_control> control_;
+  alignas(cmsghdr) std::array<std::uint8_t, control_size> control_;
   msghdr message_{};
 };
 
@@ -127,7 +125,7 @@ int send_packet(int socket, std::span<const std::uint8_t> packet, int passed) {
   msghdr message{};
   message.msg_iov = &part;
   message.msg_iovlen = 1;
-  alignas(cmsghdr) std::array<std::uint8_t, sent_control> control{};
+  alignas(cmsghdr) std::array<std::uint8_t, control_size> control{};
   if (passed >= 0) {
     message.msg_control = control.data();
     message.msg_controllen = control.size();

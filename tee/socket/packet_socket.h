@@ -34,7 +34,7 @@ enum class arrival {
   packet,
   end,      ///< the other side has closed, or has died
   overdue,  ///< nothing came within the limit
-  unfit,    ///< a packet that is longer than the room, or of whose descriptors some are lost; it is gone
+  unfit,    ///< a packet that is longer than the room, or that brings more descriptors than anything needs; it is gone
 };
 
 /// How it came.
