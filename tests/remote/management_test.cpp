@@ -19,6 +19,17 @@ using remote::frame_kind;
 class ManagementTest : public ServerTest {
  protected:
   ManagementTest() { serve(); }
+
+  /// Has a TA trace 5000 lines, numbered from 0.
+  void trace_more_than_is_kept() {
+    const auto client = greeted();
+    const std::uint32_t session = client->must_open(first_ta::uuid);
+    first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) {
+      for (int i = 0; i < 5000; ++i) tee_trace("function", i, 3, "line\n");
+      return TEE_SUCCESS;
+    };
+    EXPECT_EQ(client->invoke(session).done.result, TEEC_SUCCESS);
+  }
 };
 
 TEST_F(ManagementTest, TheStatusCountsWhatThereIs) {
@@ -111,13 +122,7 @@ TEST_F(ManagementTest, TheLogComesWholeHoweverLongItIs) {
 }
 
 TEST_F(ManagementTest, WhatTheTraceHasForgottenIsLeftOut) {
-  const auto client = greeted();
-  const std::uint32_t session = client->must_open(first_ta::uuid);
-  first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) {
-    for (int i = 0; i < 5000; ++i) tee_trace("function", i, 3, "line\n");
-    return TEE_SUCCESS;
-  };
-  EXPECT_EQ(client->invoke(session).done.result, TEEC_SUCCESS);
+  trace_more_than_is_kept();
   server_management management;
   server_log log;
   ASSERT_EQ(management.connect(name()).result, TEEC_SUCCESS);
@@ -127,13 +132,7 @@ TEST_F(ManagementTest, WhatTheTraceHasForgottenIsLeftOut) {
 }
 
 TEST_F(ManagementTest, TheLatestLinesAreThoseThatAreAskedForAndKept) {
-  const auto client = greeted();
-  const std::uint32_t session = client->must_open(first_ta::uuid);
-  first.invoke = [](void*, std::uint32_t, std::uint32_t, TEE_Param*) {
-    for (int i = 0; i < 5000; ++i) tee_trace("function", i, 3, "line\n");
-    return TEE_SUCCESS;
-  };
-  EXPECT_EQ(client->invoke(session).done.result, TEEC_SUCCESS);
+  trace_more_than_is_kept();
   const std::uint64_t total = status().trace_total;
   server_management management;
   server_log log;
