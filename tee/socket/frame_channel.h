@@ -43,10 +43,12 @@ class frame_channel {
   /// watches for as long as usual commands take.
   void use_slots(mapped_memory memory, slot_layout layout, side mine);
   [[nodiscard]] bool has_slots() const { return memory_.has_value(); }
+
+  /// empty_slots takes the pages away from the slots' file, when the other side has gone: see mapped_memory.
   void empty_slots();
 
-  /// receive waits for the next frame, from wherever it comes. A wake-up without a frame, and what is in a slot and is
-  /// none, are unfit.
+  /// receive waits for the next frame, from wherever it comes. What is in a slot and is none is unfit, and so is a
+  /// wake-up without a frame for who sleeps; who is awake gets it as the packet that it is, which is no frame.
   [[nodiscard]] received receive(std::span<std::uint8_t> room);
 
   /// send is send_packet. put hands the frame over in the slot, and answers EPROTO when the other side has spoilt that.
